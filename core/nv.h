@@ -1,0 +1,53 @@
+#pragma once
+// The factory NV record as handlers and start-up use it: a zero-filled block, read whole,
+// one field changed, written whole. Field offsets are the record's fixed layout.
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+
+#include "platform/factory.h"
+
+namespace nv {
+
+constexpr size_t kRtFlag = 8;             // read by AT+QXRT=0
+constexpr size_t kAdbFlag = 12;           // 1 while the debug port is to stay open
+constexpr size_t kBrand = 16;             // 50-byte text
+constexpr size_t kQxsnOk = 112;           // the system check has passed
+constexpr size_t kChipId = 172;           // 68-byte text
+constexpr size_t kResetDelay = 384;       // seconds of a pending delayed reset
+constexpr size_t kUpdateFlag = 392;       // bit 0 delayed reset, bit 5 factory logging
+constexpr size_t kAssemblyAtMode = 488;
+constexpr size_t kDefaultAtMode = 664;    // one character
+constexpr size_t kFirstBootDone = 688;
+
+struct Record {
+    unsigned char bytes[PYXA_NV_SIZE] = {};
+
+    int32_t i32(size_t off) const {
+        int32_t v;
+        memcpy(&v, bytes + off, sizeof v);
+        return v;
+    }
+    void set_i32(size_t off, int32_t v) { memcpy(bytes + off, &v, sizeof v); }
+    char *text(size_t off) { return reinterpret_cast<char *>(bytes + off); }
+};
+
+// Zero-fills the record and reads it; true on success.
+inline bool read(Record &rec) {
+    memset(rec.bytes, 0, sizeof rec.bytes);
+    return get_PYXA_NV_item(rec.bytes) == 0;
+}
+inline bool write(const Record &rec) { return put_PYXA_NV_item(rec.bytes) == 0; }
+
+enum class Update { Ok, ReadFailed, WriteFailed };
+
+// Read, change one field, write back: the only way the record is ever changed.
+template <typename Fn>
+Update update(Fn &&change) {
+    Record rec;
+    if (!read(rec)) return Update::ReadFailed;
+    change(rec);
+    return write(rec) ? Update::Ok : Update::WriteFailed;
+}
+
+}  // namespace nv

@@ -1,0 +1,13 @@
+#pragma once
+
+// Frames the handler's answer and sends it to the source of the current line.
+void writeDataToserialByResponseType(const char *echo, const char *body, int result);
+// Raw bytes to the current source; logged to the command log except for the local socket.
+void writeDataToSerial(const char *data, int len);
+void writeDataToSocket(const char *data, int len);
+void saveCommand2File(const char *text);
+// One blocking read from the current source; 0 for a source that cannot be read.
+int readDataFromSerial(char *buf, int len);
+
+// The trailer line (word and CR LF) of a ResultCode; nullptr for "no answer at all".
+const char *trailer_for(int result);

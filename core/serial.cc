@@ -1,0 +1,134 @@
+// The two serial command sources: the debug UART and the USB gadget serial port.
+#include <errno.h>
+#include <fcntl.h>
+#include <pthread.h>
+#include <poll.h>
+#include <termios.h>
+#include <unistd.h>
+
+#include <cstring>
+
+#include "core/dispatch.h"
+#include "core/port_state.h"
+#include "core/transports.h"
+#include "platform/device.h"
+#include "platform/log.h"
+
+namespace {
+
+constexpr const char *kUartPath = "/dev/ttyMSM0";
+constexpr const char *kUsbPath = "/dev/ttyGS0";
+
+void start_thread(void *(*fn)(void *)) {
+    pthread_t tid;
+    pthread_create(&tid, nullptr, fn, nullptr);
+}
+
+bool wait_readable(int fd) {
+    struct pollfd pfd = {fd, POLLIN, 0};
+    int ret = poll(&pfd, 1, -1);
+    if (ret < 0) {
+        LOGE("select  Fail ret:%d, errno:%d", ret, errno);
+        return false;
+    }
+    return true;
+}
+
+// After a read error or end of file: close, one reopen, and on success the NULL line.
+// False when the port cannot be reopened: the transport's thread then ends.
+bool reopen(int *slot, const char *path) {
+    LOGE("Error in serail read:%d", errno);
+    close(*slot);
+    *slot = open_serial_device(path);
+    if (*slot < 0) {
+        LOGE("The process is terminated due to fatal error");
+        return false;
+    }
+    LOGI("The FD is reopen successfully");
+    run_null_line();
+    return true;
+}
+
+void *serial_thread(int *slot, const char *path, void (*monitor)()) {
+    for (int attempt = 0; attempt < 5; ++attempt) {
+        *slot = open_serial_device(path);
+        if (*slot >= 0) {
+            monitor();
+            break;
+        }
+        LOGE("Fail to open %s, errno = %d", path, errno);
+        sleep(2);
+    }
+    pthread_detach(pthread_self());
+    return nullptr;
+}
+
+}  // namespace
+
+int open_serial_device(const char *path) {
+    LOGI("Opened serial port:%s", path);
+    int fd;
+    do {
+        fd = dev::open(path, O_RDWR | O_NOCTTY | O_NONBLOCK);
+    } while (fd < 0 && errno == EINTR);
+    if (fd < 0) {
+        LOGE("Fail to open serial device(%s) with error code:%d", path, errno);
+        return -1;
+    }
+    fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) & ~O_NONBLOCK);
+
+    struct termios tio {};
+    tcgetattr(fd, &tio);
+    if (is_uart_flag == 1) {
+        cfsetispeed(&tio, B115200);
+        cfsetospeed(&tio, B115200);
+    }
+    tio.c_lflag = ICANON;  // one read, one line; no echo, no signals
+    tio.c_oflag &= ~(OPOST | OLCUC | OCRNL | ONOCR | ONLRET);
+    tcflush(fd, TCIFLUSH);
+    tcsetattr(fd, TCSANOW, &tio);
+    return fd;
+}
+
+void uart_init() { start_thread(uart_thread); }
+void vcom_init() { start_thread(vcom_thread); }
+
+void *uart_thread(void *) { return serial_thread(&g_port.uart_fd, kUartPath, uart_monitor); }
+void *vcom_thread(void *) { return serial_thread(&g_port.usb_fd, kUsbPath, vcom_monitor); }
+
+void uart_monitor() {
+    for (;;) {
+        if (!wait_readable(g_port.uart_fd)) continue;
+        memset(g_port.recv_buf, 0, sizeof g_port.recv_buf);
+        ssize_t n = read(g_port.uart_fd, g_port.recv_buf, kLineSize - 1);
+        if (n == 1) continue;  // a lone line end
+        if (n <= 0) {
+            if (!reopen(&g_port.uart_fd, kUartPath)) return;
+            continue;
+        }
+        dispatch_command(g_port.recv_buf, static_cast<int>(n), SRC_UART);
+    }
+}
+
+// The gadget port may deliver a line in pieces: gather until a line end arrives, and
+// never throw gathered input away (a full buffer or a failed read dispatches it).
+void vcom_monitor() {
+    int offset = 0;
+    for (;;) {
+        if (!wait_readable(g_port.usb_fd)) continue;
+        if (offset == 0) memset(g_port.recv_buf, 0, sizeof g_port.recv_buf);
+        ssize_t n = read(g_port.usb_fd, g_port.recv_buf + offset, static_cast<size_t>(kLineSize - 1 - offset));
+        int total = offset + static_cast<int>(n);
+        if (n >= 1 && g_port.recv_buf[total - 1] != '\r' && g_port.recv_buf[total - 1] != '\n') {
+            offset = total;
+            continue;
+        }
+        offset = 0;
+        if (total == 1) continue;
+        if (total > 1) {
+            dispatch_command(g_port.recv_buf, total, SRC_USB);
+            continue;
+        }
+        if (!reopen(&g_port.usb_fd, kUsbPath)) return;
+    }
+}

@@ -1,0 +1,15 @@
+#pragma once
+// Work that must outlast its answer runs on a detached worker thread.
+
+// Starts fn(arg) on a new thread with default attributes; the worker detaches itself.
+// Returns pthread_create's result (0 on success).
+int start_worker(void *(*fn)(void *), void *arg);
+
+// Restarts the device two seconds after the answer has left; arg is a reason text or null.
+void *reboot_thread(void *reason);
+
+// Long-running workers stop when their handler clears the run flag.
+extern int g_vibrator_run;
+extern int g_lights_run;
+void *update_vibrator_thread(void *);
+void *update_indicate_lights_thread(void *);
