@@ -46,3 +46,10 @@ unsigned int tcp_service_address();  // IPv4, network byte order
 const char *local_socket_name();
 
 }  // namespace dev
+
+namespace dev {
+
+// chown(): gives a file an owner and group (the system user, 1000, for persist files).
+int chown(const char *path, uid_t owner, gid_t group);
+
+}  // namespace dev

@@ -23,7 +23,8 @@ int kaelatcmd_read_system_file(const char *path, char *buf, int len);  // 0 on s
 int kaelatcmd_fwrite_system_file(const char *path, const char *mode, const char *text);
 // Reads a node through the policy layer; bytes read, negative on failure.
 int read_policy_file(int mode, const char *path, char *buf, int len);
-// Writes text into an existing file opened with flags; 0 on success, negative on failure.
+// Writes text into a file opened with flags (an existing node, or a new file, mode 0666,
+// when flags hold O_CREAT); 0 on success, negative on failure.
 int write_policy_file(int mode, const char *path, int flags, const char *text);
 int write_int(const char *path, int value);  // 0 on success
 int readFromFile(const char *path, char *buf, int len);  // bytes read, negative on failure
@@ -72,5 +73,60 @@ char *delete_char(char *text, char c);
 
 // ---- audio factory-test layer (start-up)
 int at_set_audio_init_ftm(void);
+
+// ---- display and touch
+// Blanks (1) or unblanks (0) the second screen's framebuffer when there is no Android UI.
+int minui_gr_fb_blank_second(int blank);
+// The value of a max_brightness node, or negative when it cannot be read.
+int get_max_brightness(const char *path);
+// Runs the touch panel's sensor test for an item code ("165" to "168"); 0 on success.
+int touchpanel_sensor_test(int count, const char *item);
+
+// ---- storage
+// Runs a shell command line. Its output (at most size - 1 bytes, NUL-terminated) goes
+// into buf only when there is some: a caller's preset text survives a silent command.
+// Returns the count of output bytes, or negative when the command could not be run.
+int ext_system(const char *command, char *buf, int size);
+// The factory test-data files on the card, as an opaque list; NULL when there are none.
+struct tf_data_list;
+struct tf_data_list *get_tf_data_file_list(int type);
+long long get_tf_data_file_size(struct tf_data_list *list);  // bytes of all files
+void tf_data_list_free(struct tf_data_list *list);
+// Fill the flash chip's maker / bill-of-materials text (buffers of at least 64 bytes).
+int get_emmc_manufacture(char *buf);  // 0 on success
+int get_emmc_bom(char *buf);          // 0 on success
+
+// ---- camera service
+// Sends one "#"-separated camera message and blocks until the reply, which is never
+// NULL and stays valid until the next call on this thread; the caller does not free it.
+const char *sendMessageToCamera(const char *message);
+// Serial number text of a camera module ("rear_camera_main"...); kind is "sn_code".
+int get_camera_info_code(const char *kind, const char *camera, char *buf, int len);  // 0 on success
+#define CAMERA_ITEM_NAME_SIZE 46
+// Newer camera interface: turns an AT command into a camera message (msg, msg_len bytes)
+// and a calibration item name (item, CAMERA_ITEM_NAME_SIZE bytes, empty if none);
+// -1 when the command cannot be translated.
+int transform_at_cmd_to_camera_info(const char *command, char *msg, int msg_len, char *item);
+// Turns a camera reply into the response body (len bytes); returns a ResultCode, 7 on pass.
+int transform_camera_ret_to_at_resp(const char *reply, char *body, int len);
+int is_support_new_camera_interface(void);
+// facing: 1 front, 0 rear; role: "Master", "RTBOnly", "Wide" or "Macro".
+int is_support_target_camera(int facing, const char *role);
+// Checks the OTP memory of the camera named by a status property, noting it in body
+// (len bytes); nonzero when the OTP data is good.
+int get_target_camera_otp_status(char *body, int len, const char *property);
+
+// ---- NFC
+int kaelatcmd_getCPLC(int mode);  // reads the secure element's CPLC data; 0 on success
+// Trims surrounding blanks and double quotes from text in place; returns text.
+char *substring(char *text);
+bool is_hex_string(const char *text);  // true for a non-empty text of hexadecimal digits
+
+// ---- more text helpers
+bool isDigitValue(const char *text);  // true for a non-empty text of decimal digits
+void uppercase_to_lowcase(char *text, int len);  // lowers the letters of text[0..len) in place
+// A new string (free() it) holding len characters of text from start; NULL when start
+// lies beyond the text.
+char *get_substring(const char *text, int start, int len);
 
 }  // extern "C"

@@ -45,3 +45,10 @@ int release_wake_lock(const char *id) {
 }
 
 }  // extern "C"
+
+// A host build of liblog drops debug lines by default; a simulated phone shows them all,
+// as logcat on a phone would.
+#include <android/log.h>
+namespace {
+const int g_log_all = (__android_log_set_minimum_priority(ANDROID_LOG_DEBUG), 0);
+}

@@ -105,7 +105,7 @@ int readFromFile(const char *path, char *buf, int len) {
 int read_policy_file(int, const char *path, char *buf, int len) { return readFromFile(path, buf, len); }
 
 int write_policy_file(int, const char *path, int flags, const char *text) {
-    int fd = dev::open(path, flags & ~O_CREAT);
+    int fd = dev::open(path, flags, 0666);  // the persist files are created with O_CREAT
     if (fd < 0) return -errno;
     size_t len = strlen(text);
     ssize_t n = ::write(fd, text, len);

@@ -1,0 +1,18 @@
+#pragma once
+// Scripts of the simulated phone's libraries: plain files under <root>/.sim that a
+// station engineer edits while the simulator runs (every call reads them afresh).
+#include <string>
+
+namespace sim {
+
+// A reply script of "message => reply" lines. "*" in a message pattern stands for any
+// text; an exact line wins over patterns, and among patterns the one with the most
+// fixed characters wins (the first of equals). "\n" in a reply is a line break.
+// True when a line matched; reply then holds its reply text.
+bool script_reply(const std::string &file, const std::string &message, std::string &reply);
+
+// One key of a key=value state file, or def when it is missing or not a number.
+long script_long(const std::string &file, const std::string &key, long def);
+std::string script_text(const std::string &file, const std::string &key, const std::string &def);
+
+}  // namespace sim

@@ -1,0 +1,116 @@
+#include "tests/support/daemon.h"
+
+#include <arpa/inet.h>
+#include <cutils/sockets.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <fstream>
+#include <sstream>
+#include <stdexcept>
+#include <thread>
+
+std::string read_some(int fd, size_t want, int timeout_ms) {
+    std::string out;
+    char buf[4096];
+    while (out.size() < want) {
+        struct pollfd p = {fd, POLLIN, 0};
+        if (poll(&p, 1, timeout_ms) <= 0) break;
+        ssize_t n = read(fd, buf, sizeof buf);
+        if (n <= 0) break;
+        out.append(buf, static_cast<size_t>(n));
+    }
+    return out;
+}
+
+int free_tcp_port() {
+    int s = socket(AF_INET, SOCK_STREAM, 0);
+    struct sockaddr_in a {};
+    a.sin_family = AF_INET;
+    a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    bind(s, reinterpret_cast<sockaddr *>(&a), sizeof a);
+    socklen_t len = sizeof a;
+    getsockname(s, reinterpret_cast<sockaddr *>(&a), &len);
+    close(s);
+    return ntohs(a.sin_port);
+}
+
+Daemon::Daemon(const Sandbox &b, const std::string &cmdline, bool wait_ready) : box(b) {
+    port = free_tcp_port();
+    local_name = "ftcmd_test_" + std::to_string(getpid()) + "_" + std::to_string(port);
+    log_path = box.dir + "/daemon.log";
+    box.write("/proc/cmdline", cmdline + "\n");
+    pid = fork();
+    if (pid == 0) {
+        int fd = open(log_path.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+        dup2(fd, 2);
+        setenv("FTCMD_SIM_ROOT", box.root.c_str(), 1);
+        setenv("FTCMD_TCP_PORT", std::to_string(port).c_str(), 1);
+        setenv("FTCMD_LOCAL_SOCKET", local_name.c_str(), 1);
+        setenv("FTCMD_SIM_LISTEN", "127.0.0.1", 1);
+        execl(FTCMD_BIN, "ftcmd", static_cast<char *>(nullptr));
+        _exit(127);
+    }
+    if (wait_ready && !wait_prop("sys.qrcode.view", "1")) throw std::runtime_error("daemon did not come up");
+}
+
+Daemon::~Daemon() {
+    if (pid > 0) {
+        kill(pid, SIGKILL);
+        waitpid(pid, nullptr, 0);
+    }
+}
+
+bool Daemon::wait_prop(const std::string &name, const std::string &value, int timeout_ms) const {
+    for (int waited = 0; waited < timeout_ms; waited += 20) {
+        if (box.prop(name) == value) return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    }
+    return false;
+}
+
+std::string Daemon::log() const {
+    std::ifstream in(log_path);
+    std::ostringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
+}
+
+bool Daemon::wait_log(const std::string &text, int timeout_ms) const {
+    for (int waited = 0; waited < timeout_ms; waited += 20) {
+        if (log().find(text) != std::string::npos) return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    }
+    return false;
+}
+
+int Daemon::connect_tcp() const {
+    int s = socket(AF_INET, SOCK_STREAM, 0);
+    struct sockaddr_in a {};
+    a.sin_family = AF_INET;
+    a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    a.sin_port = htons(static_cast<uint16_t>(port));
+    if (connect(s, reinterpret_cast<sockaddr *>(&a), sizeof a) != 0) {
+        close(s);
+        return -1;
+    }
+    return s;
+}
+
+int Daemon::connect_local() const {
+    return socket_local_client(local_name.c_str(), ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM);
+}
+
+int Daemon::stop(int sig) {
+    kill(pid, sig);
+    int status = 0;
+    waitpid(pid, &status, 0);
+    pid = -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}

@@ -1,0 +1,32 @@
+#pragma once
+// Runs the real daemon binary on a sandbox and talks to it over its transports.
+#include <sys/types.h>
+
+#include <string>
+
+#include "tests/support/sandbox.h"
+
+// Reads from fd until want bytes arrived or timeout_ms passed with nothing new.
+std::string read_some(int fd, size_t want, int timeout_ms = 3000);
+int free_tcp_port();
+
+struct Daemon {
+    const Sandbox &box;
+    pid_t pid = -1;
+    int port = 0;
+    std::string local_name;
+    std::string log_path;  // the daemon's stderr: its Android log
+
+    // Starts the daemon with the given kernel command line; waits until the TCP
+    // service waits for a station (unless wait_ready is false).
+    Daemon(const Sandbox &box, const std::string &cmdline = "", bool wait_ready = true);
+    ~Daemon();
+
+    bool wait_prop(const std::string &name, const std::string &value, int timeout_ms = 5000) const;
+    bool wait_log(const std::string &text, int timeout_ms = 5000) const;
+    std::string log() const;
+    int connect_tcp() const;
+    int connect_local() const;
+    // Sends a signal and returns the exit status (or 128+signal when killed by it).
+    int stop(int sig);
+};
