@@ -28,8 +28,14 @@ struct Pty {
         unlockpt(master);
         slave = ptsname(master);
         std::filesystem::create_symlink(slave, box.path(device));
+        // Held open so that the master does not see a hang-up while the daemon reopens.
+        keep = open(slave.c_str(), O_RDWR | O_NOCTTY);
     }
-    ~Pty() { close(master); }
+    ~Pty() {
+        close(keep);
+        close(master);
+    }
+    int keep = -1;
     void send(const std::string &s) const { ASSERT_EQ(write(master, s.data(), s.size()), (ssize_t)s.size()); }
     speed_t speed() const {
         int fd = open(slave.c_str(), O_RDWR | O_NOCTTY);
@@ -118,14 +124,14 @@ TEST(Daemon, UsbSerialAssemblesLinesAndReopensAfterHangUp) {
     usb.send("1\r");
     std::string a = "AT+QXNOPE=1\r\n" + kNotSupported;
     EXPECT_EQ(read_some(usb.master, a.size() + 1, 2000), a);
+    EXPECT_EQ(usb.speed(), B38400);  // no UART mode: the line speed is left alone
     usb.send("\r");  // a lone line end is ignored
     EXPECT_EQ(read_some(usb.master, 1, 300), "");
-    EXPECT_EQ(usb.speed(), B38400);  // no UART mode: the line speed is left alone
 
     box.set_prop("sys.qrcode.view", "0");
     usb.send("\x04");  // end of file at the start of a line: the port reads 0
     std::string hangup = "AT+QXMT=1,0\r\n\r\nNot Implement\r\n";
-    EXPECT_EQ(read_some(usb.master, hangup.size(), 3000), hangup);  // the last source was USB
+    EXPECT_EQ(read_some(usb.master, hangup.size(), 3000), hangup) << d.log();  // the last source was USB
     EXPECT_TRUE(d.wait_log("The FD is reopen successfully"));
     EXPECT_EQ(box.prop("sys.qrcode.view"), "1");
     usb.send("AT+QXNOPE=1\r");
