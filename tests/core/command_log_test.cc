@@ -1,7 +1,7 @@
 // The command log: record format, text cut, and rotation at its size boundaries.
 #include <regex>
 
-#include "tests/core/in_process.h"
+#include "tests/support/in_process.h"
 
 namespace {
 

@@ -1,7 +1,7 @@
 // Line cleaning, table lookup and the frames the dispatcher itself writes.
 #include <cstring>
 
-#include "tests/core/in_process.h"
+#include "tests/support/in_process.h"
 
 namespace {
 

@@ -1,7 +1,7 @@
 // The answer frame for every ResultCode, and where frames are routed.
 #include <fcntl.h>
 
-#include "tests/core/in_process.h"
+#include "tests/support/in_process.h"
 
 namespace {
 
