@@ -43,7 +43,8 @@ int put_PYXA_NV_item(const void *record);  // 0 on success
 // Sends a text to the test app and returns its reply, or NULL when it did not answer.
 // The reply stays valid until the next call on this thread.
 const char *sendMessage(const char *text);
-int startActivityFromFtcmd(const char *component, int flags, const char *extras);
+// action may be null (the activity's default), as the end-of-line commands start them.
+int startActivityFromFtcmd(const char *component, const char *action, const char *extras);
 int startServiceFromFtcmd(const char *component, const char *action, const char *extras);
 int stopServiceFromFtcmd(const char *component, const char *action, const char *extras);
 int sendBroadcastFromFtcmd(const char *action, const char *component, const char *extras);
@@ -51,8 +52,9 @@ int isServiceWork(const char *component);  // 1 while the service runs
 
 // ---- device and build identity
 int is_project(const char *code);
-int is_above_PD_project(void);
-int is_above_TD_project(void);
+// True when the phone's project number is at or above the given one.
+int is_above_PD_project(int number);
+int is_above_TD_project(int number);
 int is_bsp_version(void);
 bool get_emmcid(char *buf);           // 101 bytes; false with errno set on failure
 int get_cpuid(char *buf, int len);    // 0 on success, errno set on failure

@@ -195,8 +195,8 @@ const char *sendMessage(const char *text) {
     return reply;
 }
 
-int startActivityFromFtcmd(const char *component, int flags, const char *extras) {
-    sim::record("activity", opt(component) + " " + std::to_string(flags) + " " + opt(extras));
+int startActivityFromFtcmd(const char *component, const char *action, const char *extras) {
+    sim::record("activity", opt(component) + " " + opt(action) + " " + opt(extras));
     return 0;
 }
 
@@ -229,8 +229,8 @@ int isServiceWork(const char *component) {
 // ---- device and build identity
 
 int is_project(const char *code) { return code && sim::config("project") == code; }
-int is_above_PD_project(void) { return sim::config("above_pd_project", "0") == "1"; }
-int is_above_TD_project(void) { return sim::config("above_td_project", "0") == "1"; }
+int is_above_PD_project(int number) { return atoi(sim::config("project_number", "0").c_str()) >= number; }
+int is_above_TD_project(int number) { return atoi(sim::config("project_number", "0").c_str()) >= number; }
 int is_bsp_version(void) { return sim::config("bsp_version", "0") == "1"; }
 
 bool get_emmcid(char *buf) {
