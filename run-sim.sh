@@ -6,4 +6,4 @@ cd "$(dirname "$0")"
 scripts/install-deps.sh
 cmake --preset release >/dev/null
 cmake --build --preset release >/dev/null
-exec build/release/tools/ftcmd-sim "$@"
+exec build/release/ftcmd-sim "$@"

@@ -14,6 +14,7 @@
 // A station hangs up by sending ^D (0x04) at the start of a line: the daemon's side is
 // in canonical mode, so its read returns 0 exactly as when a USB cable is pulled, and
 // the daemon runs its reopen path.
+#include <arpa/inet.h>
 #include <errno.h>
 #include <fcntl.h>
 #include <limits.h>
@@ -25,9 +26,8 @@
 #include <termios.h>
 #include <time.h>
 #include <unistd.h>
-#include <arpa/inet.h>
 
-#include <atomic>
+#include <algorithm>
 #include <chrono>
 #include <cstdio>
 #include <cstring>
@@ -239,9 +239,11 @@ void reset_boot_properties(const std::string &root, bool keep_boot) {
     std::string offset;
     long off = sim::read_file(root + "/.sim/clock", offset) ? strtol(offset.c_str(), nullptr, 10) : 0;
     std::string boot_time = std::to_string(static_cast<long>(time(nullptr)) + off);
+    std::string known;
     bool ok = sim::write_kv(props, "sys.qrcode.view", nullptr);
-    if (!keep_boot) {
+    if (!keep_boot || !sim::read_kv(props, "sys.boot_completed.time", known))
         ok = ok && sim::write_kv(props, "sys.boot_completed.time", &boot_time);
+    if (!keep_boot) {
         ok = ok && sim::write_kv(props, "sys.factory.assembly_at_mode", nullptr);
         ok = ok && sim::write_kv(props, "sys.factory.log", nullptr);
     }
@@ -345,11 +347,9 @@ void relay(std::vector<Port> *ports, int stop_fd) {
             return;
         }
         if (fds[0].revents) return;
-        bool idle = true;
         for (size_t i = 0; i < ports->size(); ++i) {
             Port &p = (*ports)[i];
             short phone = fds[1 + 2 * i].revents, station = fds[2 + 2 * i].revents;
-            if (phone || station) idle = false;
             if (phone & POLLIN) pump(p.phone.master, p.to_station);
             if (station & POLLIN) pump(p.station.master, p.to_phone);
             flush(p.station.master, p.to_station);
@@ -358,7 +358,7 @@ void relay(std::vector<Port> *ports, int stop_fd) {
         // A master in an error state (it should not happen: we hold both slaves) must not spin.
         bool errors = false;
         for (size_t i = 1; i < fds.size(); ++i) errors |= (fds[i].revents & (POLLERR | POLLHUP | POLLNVAL)) != 0;
-        if (idle || errors) usleep(10000);
+        if (errors) usleep(10000);
     }
 }
 
@@ -487,7 +487,7 @@ int main(int argc, char **argv) {
     auto since = [](std::chrono::steady_clock::time_point t) {
         return std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() - t).count();
     };
-    bool stopping = false, killed = false;
+    bool stopping = false, killed = false, timed_out = false;
     std::chrono::steady_clock::time_point stop_at;
     for (;;) {
         struct timespec tick = {0, 50 * 1000 * 1000};
@@ -499,9 +499,9 @@ int main(int argc, char **argv) {
         }
         int status = 0;
         if (waitpid(child, &status, WNOHANG) == child) {
-            if (!stopping || !(WIFEXITED(status) || WTERMSIG(status) == SIGKILL)) say(describe(status));
+            say(describe(status));
             if (!ready && !stopping) fprintf(stderr, "ftcmd-sim: the daemon ended before it was ready\n");
-            exit_code = status_code(status);
+            exit_code = timed_out ? 1 : status_code(status);
             break;
         }
         if (stopping && !killed && since(stop_at) > kStopGraceMs) {
@@ -518,11 +518,10 @@ int main(int argc, char **argv) {
                         kReadyTimeoutMs / 1000, (root + "/.sim/properties").c_str());
                 kill(child, SIGTERM);
                 stop_at = std::chrono::steady_clock::now();
-                stopping = true;
+                stopping = timed_out = true;
             }
         }
     }
-    if (!ready && exit_code == 0) exit_code = 1;
 
     ssize_t w = write(stop_pipe[1], "x", 1);
     (void)w;

@@ -1,0 +1,351 @@
+// The host tools as processes: ftcmd-sim runs a simulated phone, ftcmd-at (and stock
+// clients: nc, socat) talk to it. Each test has its own sandbox, port and socket name.
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "tests/support/daemon.h"
+
+namespace fs = std::filesystem;
+
+namespace {
+
+const std::string kNotSupportedTcp = "AT+QXWLAN\r\n\r\n\"AT not support\"\r\nERROR\r\n";
+const std::string kNotSupportedBare = "AT+QXWLAN\r\n\"AT not support\"\r\nERROR\r\n";
+
+struct Outcome {
+    int status = -1;
+    std::string out;
+};
+
+// Runs argv with input on stdin; stdout is returned, stderr goes to the test's log.
+Outcome run(const std::vector<std::string> &argv, const std::string &input = "") {
+    int in[2], out[2];
+    if (pipe(in) != 0 || pipe(out) != 0) return {};
+    pid_t pid = fork();
+    if (pid == 0) {
+        dup2(in[0], 0);
+        dup2(out[1], 1);
+        for (int fd : {in[0], in[1], out[0], out[1]}) close(fd);
+        std::vector<char *> args;
+        for (const auto &a : argv) args.push_back(const_cast<char *>(a.c_str()));
+        args.push_back(nullptr);
+        execvp(args[0], args.data());
+        _exit(127);
+    }
+    close(in[0]);
+    close(out[1]);
+    signal(SIGPIPE, SIG_IGN);
+    ssize_t w = write(in[1], input.data(), input.size());
+    (void)w;
+    close(in[1]);
+    Outcome r;
+    r.out = read_some(out[0], SIZE_MAX, 30000);
+    close(out[0]);
+    int status = 0;
+    waitpid(pid, &status, 0);
+    r.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    return r;
+}
+
+// One ftcmd-sim process; a test that fails half-way still ends it (and so its daemon).
+struct Launcher {
+    std::string root;
+    int port = free_tcp_port();
+    std::string local;
+    pid_t pid = -1;
+    int out_fd = -1;
+    std::string out;  // its stdout so far
+
+    Launcher(const std::string &root_dir, std::vector<std::string> extra = {}) : root(root_dir) {
+        local = "ftcmd_tools_test_" + std::to_string(getpid()) + "_" + std::to_string(port);
+        std::vector<std::string> argv = {FTCMD_SIM_BIN, "--root", root, "--port", std::to_string(port),
+                                         "--local", local};
+        argv.insert(argv.end(), extra.begin(), extra.end());
+        int p[2];
+        if (pipe(p) != 0) return;
+        pid = fork();
+        if (pid == 0) {
+            dup2(p[1], 1);
+            int log = open((root + ".log").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644);
+            dup2(log, 2);
+            close(p[0]);
+            close(p[1]);
+            std::vector<char *> args;
+            for (const auto &a : argv) args.push_back(const_cast<char *>(a.c_str()));
+            args.push_back(nullptr);
+            execv(args[0], args.data());
+            _exit(127);
+        }
+        close(p[1]);
+        out_fd = p[0];
+    }
+    ~Launcher() {
+        if (pid > 0) stop(SIGKILL);
+        if (out_fd >= 0) close(out_fd);
+    }
+    bool wait_for(const std::string &text, int timeout_ms = 10000) {
+        auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeout_ms);
+        while (out.find(text) == std::string::npos && std::chrono::steady_clock::now() < until) {
+            std::string more = read_some(out_fd, 1, 100);
+            out += more;
+        }
+        return out.find(text) != std::string::npos;
+    }
+    bool ready() { return wait_for("ftcmd-sim: ready\n"); }
+    int stop(int sig) {
+        kill(pid, sig);
+        int status = 0;
+        for (int i = 0; i < 100 && waitpid(pid, &status, WNOHANG) == 0; ++i)
+            std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        if (waitpid(pid, &status, WNOHANG) == 0) {
+            kill(pid, SIGKILL);
+            waitpid(pid, &status, 0);
+        }
+        pid = -1;
+        return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    }
+    std::string tcp() const { return "127.0.0.1:" + std::to_string(port); }
+    std::string station(const char *port_name) const { return root + "/station/" + port_name; }
+};
+
+std::string read_file(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    return std::string(std::istreambuf_iterator<char>(in), {});
+}
+
+// ---- the station tool over each channel
+
+enum class Via { Tcp, Local, Serial };
+
+struct AtCase {
+    const char *name;
+    Via via;
+    std::vector<std::string> args;  // options and lines after the channel
+    std::string input;              // stdin
+    std::string expected;
+    int status;
+};
+
+void PrintTo(const AtCase &c, std::ostream *os) { *os << c.name; }
+
+class AtTest : public ::testing::TestWithParam<AtCase> {};
+
+TEST_P(AtTest, PrintsTheFramesAndJudgesTheResults) {
+    const AtCase &c = GetParam();
+    Sandbox box;
+    Launcher sim(box.root);
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    std::vector<std::string> argv = {FTCMD_AT_BIN};
+    if (c.via == Via::Tcp) argv.insert(argv.end(), {"--tcp", sim.tcp()});
+    if (c.via == Via::Local) argv.insert(argv.end(), {"--local", sim.local});
+    if (c.via == Via::Serial) argv.insert(argv.end(), {"--serial", sim.station("ttyGS0")});
+    argv.insert(argv.end(), c.args.begin(), c.args.end());
+    Outcome r = run(argv, c.input);
+    EXPECT_EQ(r.out, c.expected);
+    EXPECT_EQ(r.status, c.status);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Station, AtTest,
+    ::testing::Values(
+        AtCase{"TcpRaw", Via::Tcp, {"AT+QXWLAN"}, "", kNotSupportedBare, 1},
+        AtCase{"TcpRawCrlf", Via::Tcp, {"--crlf", "AT+QXWLAN"}, "", kNotSupportedTcp, 1},
+        AtCase{"TcpJsonOkCrlf", Via::Tcp, {"--json", "--crlf", "ATD112;"}, "",
+               "{\"line\": \"ATD112;\", \"echo\": \"ATD112;\\r\\n\", \"body\": \"\", \"result\": \"OK\"}\n", 0},
+        AtCase{"TcpJsonStdin", Via::Tcp, {"--json"}, "AT+QXWLAN=1\n\nAT+QXWLAN\n",
+               "{\"line\": \"AT+QXWLAN=1\", \"echo\": \"AT+QXWLAN=1\", \"body\": \"\", \"result\": \"Not Implement\"}\n"
+               "{\"line\": \"AT+QXWLAN\", \"echo\": \"AT+QXWLAN\", \"body\": \"\\\"AT not support\\\"\", "
+               "\"result\": \"ERROR\"}\n",
+               1},
+        AtCase{"LocalOneAnswerPerConnection", Via::Local, {"--json", "ATD112;", "ATD112;"}, "",
+               "{\"line\": \"ATD112;\", \"echo\": \"ATD112;\", \"body\": \"\", \"result\": \"OK\"}\n"
+               "{\"line\": \"ATD112;\", \"echo\": \"ATD112;\", \"body\": \"\", \"result\": \"OK\"}\n",
+               0},
+        AtCase{"SerialRaw", Via::Serial, {"AT+QXWLAN", "ATD112;"}, "", kNotSupportedBare + "ATD112;\r\nOK\r\n", 1},
+        AtCase{"NoAnswerTimesOut", Via::Serial, {"--json", "--timeout", "0.5", "xyz"}, "",
+               "{\"line\": \"xyz\", \"echo\": null, \"body\": null, \"result\": \"no answer\"}\n", 1}),
+    [](const ::testing::TestParamInfo<AtCase> &i) { return std::string(i.param.name); });
+
+// Frame shapes the current handlers do not produce yet, from a canned phone: it answers
+// the first line received with reply and keeps the connection until the station leaves.
+struct CannedCase {
+    const char *name;
+    std::string reply;
+    std::vector<std::string> lines;
+    std::string expected;
+};
+
+void PrintTo(const CannedCase &c, std::ostream *os) { *os << c.name; }
+
+class CannedTest : public ::testing::TestWithParam<CannedCase> {};
+
+TEST_P(CannedTest, SplitsFramesFromUnsolicitedLines) {
+    const CannedCase &c = GetParam();
+    int ls = socket(AF_INET, SOCK_STREAM, 0);
+    struct sockaddr_in a {};
+    a.sin_family = AF_INET;
+    a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t len = sizeof a;
+    ASSERT_EQ(bind(ls, reinterpret_cast<sockaddr *>(&a), sizeof a), 0);
+    ASSERT_EQ(listen(ls, 1), 0);
+    getsockname(ls, reinterpret_cast<sockaddr *>(&a), &len);
+    std::thread phone([&] {
+        int s = accept(ls, nullptr, nullptr);
+        read_some(s, 1);
+        send(s, c.reply.data(), c.reply.size(), MSG_NOSIGNAL);
+        read_some(s, SIZE_MAX, 5000);  // until the station closes
+        close(s);
+    });
+    std::vector<std::string> argv = {FTCMD_AT_BIN, "--tcp", "127.0.0.1:" + std::to_string(ntohs(a.sin_port)),
+                                     "--json", "--crlf", "--timeout", "1"};
+    argv.insert(argv.end(), c.lines.begin(), c.lines.end());
+    EXPECT_EQ(run(argv).out, c.expected);
+    phone.join();
+    close(ls);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Station, CannedTest,
+    ::testing::Values(
+        CannedCase{"EmptyTrailerEndsOnQuiet",
+                   "RING\r\nAT+QX=1\r\n\r\n\r\n\"v\"\r\n\r\n\r\n",
+                   {"AT+QX=1"},
+                   "{\"unsolicited\": \"RING\\r\\n\"}\n"
+                   "{\"line\": \"AT+QX=1\", \"echo\": \"AT+QX=1\\r\\n\", \"body\": \"\\r\\n\\\"v\\\"\\r\\n\", "
+                   "\"result\": \"\"}\n"},
+        CannedCase{"StreamedFrameBeforeTheAnswer",
+                   "\xff\x01\r\nAT+QX=2\r\n\r\n1\r\nOK\r\nAT+QX=1\r\n\r\nx\r\ny\r\nATNG\r\n",
+                   {"AT+QX=1"},
+                   "{\"unsolicited\": \"\\u00ff\\u0001\\r\\nAT+QX=2\\r\\n\\r\\n1\\r\\nOK\\r\\n\"}\n"
+                   "{\"line\": \"AT+QX=1\", \"echo\": \"AT+QX=1\\r\\n\", \"body\": \"x\\r\\ny\", \"result\": \"ATNG\"}\n"}),
+    [](const ::testing::TestParamInfo<CannedCase> &i) { return std::string(i.param.name); });
+
+TEST(Tools, RawOutputIsWhatNetcatReceives) {
+    Sandbox box;
+    Launcher sim(box.root);
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    for (const char *ending : {"", "\r\n"}) {
+        Outcome nc = run({"nc", "-N", "127.0.0.1", std::to_string(sim.port)}, std::string("AT+QXWLAN") + ending);
+        std::vector<std::string> argv = {FTCMD_AT_BIN, "--tcp", sim.tcp(), "AT+QXWLAN"};
+        if (*ending) argv.insert(argv.begin() + 1, "--crlf");
+        Outcome at = run(argv);
+        EXPECT_EQ(nc.out, *ending ? kNotSupportedTcp : kNotSupportedBare);
+        EXPECT_EQ(at.out, nc.out);
+    }
+}
+
+TEST(Tools, SerialStationSurvivesAHangUp) {
+    Sandbox box;
+    Launcher sim(box.root);
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    Outcome socat = run({"socat", "-t1", "-", sim.station("ttyGS0") + ",raw,echo=0"}, "AT+QXWLAN\r");
+    EXPECT_EQ(socat.out, kNotSupportedBare);
+    // ^D at the start of a line ends the daemon's read: it reopens the port and runs its
+    // hang-up command, whose frame reaches the station unasked.
+    Outcome at = run({FTCMD_AT_BIN, "--serial", sim.station("ttyGS0"), "--json", "--timeout", "1", "\x04", "ATD112;"});
+    EXPECT_NE(at.out.find("{\"unsolicited\": \"AT+QXMT=1,0\\r\\n"), std::string::npos) << at.out;
+    EXPECT_NE(at.out.find("{\"line\": \"\\u0004\", \"echo\": null, \"body\": null, \"result\": \"no answer\"}\n"),
+              std::string::npos)
+        << at.out;
+    EXPECT_NE(at.out.find("\"echo\": \"ATD112;\", \"body\": \"\", \"result\": \"OK\"}\n"), std::string::npos);
+}
+
+// ---- the launcher
+
+struct ModeCase {
+    const char *name;
+    std::vector<std::string> args;
+    const char *flags;    // the mode line
+    const char *cmdline;  // expected in proc/cmdline ("" : no console-at key at all)
+    bool uart;
+    int enters_assembly;  // -1: not checked
+};
+
+void PrintTo(const ModeCase &c, std::ostream *os) { *os << c.name; }
+
+class ModeTest : public ::testing::TestWithParam<ModeCase> {};
+
+TEST_P(ModeTest, WritesTheCommandLineAndServesTheUartOnlyWhenUsed) {
+    const ModeCase &c = GetParam();
+    Sandbox box;
+    // Left over from an earlier boot: another mode, and assembly mode running.
+    box.write("/proc/cmdline", "console=ttyMSM0,115200n8 console-at=sendNormal loop.max_part=7\n");
+    box.set_prop("sys.factory.assembly_at_mode", "2");
+    Launcher sim(box.root, c.args);
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    EXPECT_NE(sim.out.find(std::string("ftcmd-sim: mode ") + c.flags + "\n"), std::string::npos) << sim.out;
+    std::string cmdline = box.read("/proc/cmdline");
+    std::string expected = *c.cmdline ? c.cmdline : "console=ttyMSM0,115200n8 loop.max_part=7\n";
+    EXPECT_NE(cmdline.find(expected), std::string::npos) << cmdline;
+    EXPECT_EQ(fs::is_symlink(sim.station("ttyMSM0")), c.uart);
+    EXPECT_EQ(sim.out.find("ftcmd-sim: uart /dev/pts/") != std::string::npos, c.uart);
+    if (c.uart) {
+        EXPECT_EQ(run({FTCMD_AT_BIN, "--serial", sim.station("ttyMSM0"), "AT+QXWLAN"}).out, kNotSupportedBare);
+    }
+    if (c.enters_assembly >= 0) {
+        EXPECT_EQ(box.events().find("setprop sys.factory.assembly_at_mode=1") != std::string::npos,
+                  c.enters_assembly == 1);
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Launcher, ModeTest,
+    ::testing::Values(
+        ModeCase{"Plain", {"--mode", "plain"}, "plain (is_uart_flag 0, is_sp 0)", "", false, -1},
+        ModeCase{"At", {"--mode", "at"}, "at (is_uart_flag 1, is_sp 1)", " console-at=sendAT\n", true, -1},
+        ModeCase{"Normal", {"--mode", "normal"}, "normal (is_uart_flag 1, is_sp 0)", " console-at=sendNormal\n", true, -1},
+        ModeCase{"AssemblyNewBoot", {"--mode", "assembly"}, "assembly (is_uart_flag 0, is_sp 1)",
+                 " console-at=sendAT_assembly\n", false, 1},
+        ModeCase{"AssemblySameBoot", {"--mode", "assembly", "--keep-boot"}, "assembly (is_uart_flag 0, is_sp 1)",
+                 " console-at=sendAT_assembly\n", false, 0},
+        ModeCase{"WholeCommandLine", {"--cmdline", "quiet console-at=sendAT"}, "at (is_uart_flag 1, is_sp 1)",
+                 "quiet console-at=sendAT\n", true, -1}),
+    [](const ::testing::TestParamInfo<ModeCase> &i) { return std::string(i.param.name); });
+
+TEST(Tools, TwoPhonesSideBySideStopOnTheirSignals) {
+    Sandbox box;
+    Launcher a(box.root);
+    Launcher b(box.dir + "/second");  // made from the device tree
+    ASSERT_TRUE(a.ready()) << a.out;
+    ASSERT_TRUE(b.ready()) << b.out;
+    for (Launcher *sim : {&a, &b}) EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim->tcp(), "ATD112;"}).status, 0);
+    EXPECT_EQ(run({FTCMD_AT_BIN, "--local", b.local, "ATD112;"}).status, 0);
+    EXPECT_EQ(a.stop(SIGTERM), 15);
+    EXPECT_EQ(b.stop(SIGINT), 2);
+    EXPECT_FALSE(fs::exists(fs::symlink_status(box.root + "/dev/ttyGS0")));
+    EXPECT_FALSE(fs::exists(fs::symlink_status(box.dir + "/second/station/ttyGS0")));
+    // Both phones have gone: nothing listens on their ports any more.
+    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", a.tcp(), "ATD112;"}).status, 2);
+}
+
+TEST(Tools, FreshEmptiesOnlyASandbox) {
+    Sandbox box;
+    std::string other = box.dir + "/not-a-sandbox";
+    fs::create_directories(other);
+    std::ofstream(other + "/keep") << "mine";
+    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", other, "--fresh"}).status, 2);
+    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", other}).status, 2);
+    EXPECT_EQ(read_file(other + "/keep"), "mine");
+
+    box.write("/data/leftover", "x");
+    Launcher sim(box.root, {"--fresh"});
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    EXPECT_FALSE(box.exists("/data/leftover"));
+    EXPECT_TRUE(box.exists("/.sim/testapp.replies"));
+}
+
+}  // namespace
