@@ -52,29 +52,12 @@ std::vector<std::string> split(const std::string &s, char sep) {
 
 // ---- the shell behind ext_system
 
-std::string unwrap(std::string c) {
-    for (const char *pre : {"/system/bin/sh -c ", "sh -c "}) {
-        std::string p = pre;
-        if (c.compare(0, p.size(), p) == 0) {
-            c = c.substr(p.size());
-            if (c.size() >= 2 && (c.front() == '"' || c.front() == '\'') && c.back() == c.front())
-                c = c.substr(1, c.size() - 2);
-            break;
-        }
-    }
+// ext_system also takes commands with their stderr folded in or sent to the background.
+std::string unwrap(const std::string &command) {
+    std::string c = sim::shell_unwrap(command);
     for (size_t at; (at = c.find("2>&1")) != std::string::npos;) c.erase(at, 4);
     while (!c.empty() && (c.back() == ' ' || c.back() == '&')) c.pop_back();
     return c;
-}
-
-std::vector<std::string> words(const std::string &s) {
-    std::vector<std::string> out;
-    std::istringstream in(s);
-    for (std::string w; in >> w;) {
-        if (w.size() >= 2 && (w.front() == '"' || w.front() == '\'') && w.back() == w.front()) w = w.substr(1, w.size() - 2);
-        out.push_back(w);
-    }
-    return out;
 }
 
 std::string base(const std::string &prog) {
@@ -209,7 +192,7 @@ int ext_system(const char *command, char *buf, int size) {
         sim::record("shell", cmd);
         bool first = true;
         for (const auto &stage : split(c, '|')) {
-            std::vector<std::string> w = words(stage);
+            std::vector<std::string> w = sim::shell_words(stage);
             if (w.empty()) continue;
             out = run_stage(w, out, first);
             first = false;

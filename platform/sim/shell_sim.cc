@@ -12,9 +12,9 @@
 #include "platform/device.h"
 #include "platform/sim/sim.h"
 
-namespace {
+namespace sim {
 
-std::string unwrap(std::string c) {
+std::string shell_unwrap(std::string c) {
     for (const char *pre : {"/system/bin/sh -c ", "sh -c "}) {
         std::string p = pre;
         if (c.compare(0, p.size(), p) == 0) {
@@ -27,7 +27,7 @@ std::string unwrap(std::string c) {
     return c;
 }
 
-std::vector<std::string> words(const std::string &s) {
+std::vector<std::string> shell_words(const std::string &s) {
     std::vector<std::string> out;
     std::string cur;
     char quote = 0;
@@ -51,6 +51,10 @@ std::vector<std::string> words(const std::string &s) {
     return out;
 }
 
+}  // namespace sim
+
+namespace {
+
 std::string date_text() {
     time_t t = dev::now();
     struct tm tm {};
@@ -67,19 +71,19 @@ namespace dev {
 int shell(const char *command) {
     sim::record("shell", command ? command : "");
     if (command == nullptr) return 1;
-    std::string c = unwrap(command);
+    std::string c = sim::shell_unwrap(command);
 
     std::string target;
     bool append = false;
     size_t gt = c.find('>');
     if (gt != std::string::npos) {
         append = gt + 1 < c.size() && c[gt + 1] == '>';
-        std::vector<std::string> t = words(c.substr(gt + (append ? 2 : 1)));
+        std::vector<std::string> t = sim::shell_words(c.substr(gt + (append ? 2 : 1)));
         if (t.size() != 1) return 0;  // not a shape we emulate
         target = t[0];
         c = c.substr(0, gt);
     }
-    std::vector<std::string> w = words(c);
+    std::vector<std::string> w = sim::shell_words(c);
     if (w.empty()) return 0;
     std::string prog = w[0].substr(w[0].rfind('/') == std::string::npos ? 0 : w[0].rfind('/') + 1);
 

@@ -35,4 +35,9 @@ bool read_file(const std::string &host_path, std::string &out);
 bool write_file_atomic(const std::string &host_path, const std::string &data);
 std::vector<std::string> read_lines(const std::string &host_path);
 
+// The command inside "/system/bin/sh -c \"...\"" (or the command itself), and its words
+// with quotes removed: how the simulated shell reads a command line.
+std::string shell_unwrap(std::string command);
+std::vector<std::string> shell_words(const std::string &s);
+
 }  // namespace sim
