@@ -27,7 +27,9 @@ constexpr int kLogAppend = O_WRONLY | O_CREAT | O_APPEND;  // 1089
 void save_command(const char *data, size_t len) {
     if (data == nullptr || len < 2) return;
     char text[61] = {0};
-    memcpy(text, data, len < 51 ? len : 60);  // short texts whole, longer ones cut to 60
+    // Texts under 51 characters are kept whole, longer ones are copied up to 60: so 51
+    // to 60 stay whole too, and only what is longer is cut.
+    memcpy(text, data, len < 60 ? len : 60);
 
     time_t now = dev::now();
     struct tm tm {};
