@@ -3,7 +3,7 @@
 set -euo pipefail
 cd "$(dirname "$0")"
 scripts/install-deps.sh
-leftovers() { ls -d /tmp/ftcmd-test.* /tmp/ftcmd-sim.* 2>/dev/null | sort; }
+leftovers() { { ls -d /tmp/ftcmd-test.* /tmp/ftcmd-sim.* 2>/dev/null || true; } | sort; }
 before=$(leftovers)
 for preset in debug asan; do
   echo "== $preset build"
