@@ -8,6 +8,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "core/nv.h"
 #include "platform/device.h"
 #include "platform/factory.h"
 #include "platform/log.h"
@@ -27,6 +28,13 @@ int body_printf(char *resp, const char *fmt, ...) {
 int quote_body(char *resp, const char *value) { return body_printf(resp, "\r\n\"%s\"\r\n", value ? value : ""); }
 
 int quote_reason(char *resp, const char *reason) { return body_printf(resp, "\"%s\"", reason ? reason : ""); }
+
+bool quote_nv_field(char *resp, size_t offset) {
+    nv::Record rec;
+    if (!nv::read(rec)) return false;
+    body_printf(resp, "\r\n\"%d\"\r\n", rec.i32(offset));
+    return true;
+}
 
 int invalid_command(const char *cmd) {
     LOGE("invalid command: %s", cmd);

@@ -18,6 +18,10 @@ int quote_body(char *resp, const char *value);
 // A quoted reason without line ends, "\"%s\"".
 int quote_reason(char *resp, const char *reason);
 
+// Reads the NV record and answers the 32-bit field at offset as a quoted value; false,
+// with nothing written, when the record cannot be read.
+bool quote_nv_field(char *resp, size_t offset);
+
 // Logs "invalid command: %s" and answers ERROR with an empty body.
 int invalid_command(const char *cmd);
 

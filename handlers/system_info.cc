@@ -331,12 +331,10 @@ int check_is_pyxa_handler(char *cmd, int arg, char *resp) {
 
 int system_init_flag_on_handler(char *cmd, int arg, char *resp) {
     if (!line_is(cmd, "AT+QXRDNV=0")) return invalid_command(cmd);
-    nv::Record rec;
-    if (!nv::read(rec)) {
+    if (!quote_nv_field(resp, nv::kQxsnOk)) {
         LOGE("get_PYXA_NV_item failed");
         return RC_ERROR;
     }
-    body_printf(resp, "\r\n\"%d\"\r\n", rec.i32(nv::kQxsnOk));
     return RC_OK;
 }
 

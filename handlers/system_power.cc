@@ -240,34 +240,32 @@ int show_pn(const char *cmd, const char *key) {
 
 }  // namespace
 
-int shutdown_handler(char *cmd, int, char *) {
-    if (!line_is(cmd, "AT+QXGJ=0")) return invalid_command(cmd);
-    int rc = start_worker(shutdown_thread, nullptr);
+// The answer goes out now; the worker powers off or restarts two seconds later.
+static int answer_then(void *(*worker)(void *)) {
+    int rc = start_worker(worker, nullptr);
     if (rc != 0) {
         LOGE("start reboot_thread error:%d", rc);
         return RC_ERROR;
     }
     return RC_OK;
+}
+
+int shutdown_handler(char *cmd, int, char *) {
+    if (!line_is(cmd, "AT+QXGJ=0")) return invalid_command(cmd);
+    return answer_then(shutdown_thread);
 }
 
 int reboot_handler(char *cmd, int, char *) {
     if (!line_is(cmd, "AT+QXREBOOT=1")) return invalid_command(cmd);
-    int rc = start_worker(reboot_thread, nullptr);
-    if (rc != 0) {
-        LOGE("start reboot_thread error:%d", rc);
-        return RC_ERROR;
-    }
-    return RC_OK;
+    return answer_then(reboot_thread);
 }
 
 int master_handler(char *cmd, int, char *resp) {
     if (line_is(cmd, "AT+QXRT=0")) {
-        nv::Record rec;
-        if (!nv::read(rec)) {
+        if (!quote_nv_field(resp, nv::kRtFlag)) {
             LOGE("get_PYXA_NV_item(&pyxa_nvram) fail");
             return RC_ERROR;
         }
-        body_printf(resp, "\r\n\"%d\"\r\n", rec.i32(nv::kRtFlag));
         return RC_OK;
     }
     if (line_is(cmd, "AT+QXRT=1")) {
@@ -321,13 +319,11 @@ int adb_port_handler(char *cmd, int, char *resp) {
         return RC_OK;
     }
     if (line_is(cmd, "AT+QXADB=2") || line_is(cmd, "AT+QXACM=2")) {
-        nv::Record rec;
-        if (!nv::read(rec)) {
+        if (!quote_nv_field(resp, nv::kAdbFlag)) {
             LOGE("get_PYXA_NV_item failed");
             quote_reason(resp, "get NV failed");
             return RC_ERROR;
         }
-        body_printf(resp, "\r\n\"%d\"\r\n", rec.i32(nv::kAdbFlag));
         return RC_OK;
     }
     if (line_is(cmd, "AT+QXACM=4")) {
