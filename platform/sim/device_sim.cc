@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstring>
 
 #include "platform/device.h"
@@ -122,6 +123,25 @@ unsigned int tcp_service_address() {
 const char *local_socket_name() {
     const char *n = getenv("FTCMD_LOCAL_SOCKET");
     return (n && *n) ? n : "ftcmd_cmd_socket";
+}
+
+}  // namespace dev
+
+// chown(): the sandbox files keep the host user's ownership, and the change is only recorded.
+namespace dev {
+
+int chown(const char *p, uid_t owner, gid_t group) {
+    std::string detail = std::string(p ? p : "") + " " + std::to_string(owner) + ":" + std::to_string(group);
+    if (!exists(p)) {
+        errno = ENOENT;
+        return -1;
+    }
+    if (sim::fault("chown")) {
+        errno = EPERM;
+        return -1;
+    }
+    sim::record("chown", detail);
+    return 0;
 }
 
 }  // namespace dev
