@@ -1,6 +1,6 @@
-// Handlers whose test family is not built yet. They exist so that every table row has
-// a handler, and they answer "Not Implement" (101). A family that is built removes its
-// names from this list and defines them in its own source file.
+// Handlers of the commands this daemon does not carry out (fingerprint, OEM flags, CPU
+// speed, board-to-board tests and the like). They exist so that every table row has a
+// handler, and they answer "Not Implement" (101).
 #include "core/command_tables/handlers.h"
 #include "core/result.h"
 
