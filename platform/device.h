@@ -38,6 +38,8 @@ time_t now();
 int gettimeofday(struct timeval *tv);
 void sync();
 int ioctl(int fd, unsigned long request, void *arg);
+// sysconf(): the phone's own figures (_SC_PHYS_PAGES, _SC_PAGESIZE, _SC_NPROCESSORS_CONF...).
+long sysconf(int name);
 
 // Where the station services listen. On a phone: port 6988 on every IPv4 interface and
 // the local socket "ftcmd_cmd_socket"; a simulated phone may be given others.

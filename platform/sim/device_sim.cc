@@ -100,6 +100,28 @@ void sync() { sim::record("sync", ""); }
 
 int ioctl(int fd, unsigned long request, void *arg) { return ::ioctl(fd, request, arg); }
 
+// The simulated phone's memory is the MemTotal of its own proc/meminfo, in 4 KiB pages, so
+// the same command answers the same on every workstation; the processor count is config's
+// "cpus" (8 by default). Other names are not the phone's to answer.
+long sysconf(int name) {
+    constexpr long kPageSize = 4096;
+    if (name == _SC_PAGESIZE) return kPageSize;
+    if (name == _SC_PHYS_PAGES) {
+        std::string text;
+        if (!read_node("/proc/meminfo", text, 8192)) return -1;
+        size_t at = text.find("MemTotal:");
+        if (at == std::string::npos) return -1;
+        long long kb = strtoll(text.c_str() + at + 9, nullptr, 10);
+        return kb > 0 ? static_cast<long>(kb * 1024 / kPageSize) : -1;
+    }
+    if (name == _SC_NPROCESSORS_CONF || name == _SC_NPROCESSORS_ONLN) {
+        long n = strtol(sim::config("cpus", "8").c_str(), nullptr, 10);
+        return n > 0 ? n : 8;
+    }
+    errno = EINVAL;
+    return -1;
+}
+
 }  // namespace dev
 
 #include <arpa/inet.h>

@@ -229,8 +229,9 @@ int isServiceWork(const char *component) {
 // ---- device and build identity
 
 int is_project(const char *code) { return code && sim::config("project") == code; }
-int is_above_PD_project(int number) { return atoi(sim::config("project_number", "0").c_str()) >= number; }
-int is_above_TD_project(int number) { return atoi(sim::config("project_number", "0").c_str()) >= number; }
+// "Above" is strictly greater: project N itself is not above N.
+int is_above_PD_project(int number) { return atoi(sim::config("project_number", "0").c_str()) > number; }
+int is_above_TD_project(int number) { return atoi(sim::config("project_number", "0").c_str()) > number; }
 int is_bsp_version(void) { return sim::config("bsp_version", "0") == "1"; }
 
 bool get_emmcid(char *buf) {
