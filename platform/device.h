@@ -38,6 +38,10 @@ time_t now();
 int gettimeofday(struct timeval *tv);
 void sync();
 int ioctl(int fd, unsigned long request, void *arg);
+// read() and write() on a device descriptor. Some drivers take a register number from the
+// first byte of the read buffer and fill the bytes after it.
+ssize_t read(int fd, void *buf, size_t len);
+ssize_t write(int fd, const void *buf, size_t len);
 // sysconf(): the phone's own figures (_SC_PHYS_PAGES, _SC_PAGESIZE, _SC_NPROCESSORS_CONF...).
 long sysconf(int name);
 

@@ -179,3 +179,10 @@ int chown(const char *p, uid_t owner, gid_t group) {
 }
 
 }  // namespace dev
+
+namespace dev {
+
+ssize_t read(int fd, void *buf, size_t len) { return ::read(fd, buf, len); }
+ssize_t write(int fd, const void *buf, size_t len) { return ::write(fd, buf, len); }
+
+}  // namespace dev
