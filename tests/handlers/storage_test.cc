@@ -1,5 +1,7 @@
 // Storage commands: exact frames (bare CR and LF endings included), the test-app messages,
 // shell commands and files they leave, and the OTG worker's property.
+#include <sys/socket.h>
+
 #include <chrono>
 #include <filesystem>
 #include <thread>
@@ -320,6 +322,47 @@ TEST_F(StorageTest, DdrStressStartsOnlyWhenNotRunning) {
     const std::string log = box.events();
     ASSERT_NE(log.find(kStress), std::string::npos) << log;
     EXPECT_EQ(log.find(kStress), log.rfind(kStress)) << log;
+}
+
+// Over the daemon's own transports: the bodies that end in a bare CR or LF leave as they
+// are, and the OTG worker reports through its property after the answer has gone.
+std::string exchange(int fd, const std::string &line, size_t want) {
+    send(fd, line.data(), line.size(), MSG_NOSIGNAL);
+    return read_some(fd, want);
+}
+
+TEST(StorageDaemon, FlashAnswersKeepTheirBareLineEnds) {
+    Sandbox box;
+    box.write(kLifeA, "0x05\n");
+    box.write(kLifeB, "0x03\n");
+    Daemon d(box);
+    int s = d.connect_tcp();
+    ASSERT_GE(s, 0);
+    for (std::string want : {"AT+EMMCLEFT=0\r\n0x00000005\r\rNot Enough\r\nERROR\r\n", "AT+EMMCFW=1\r\n\"0300\n\"\n\r\nOK\r\n",
+                             "AT+QX_EMMC_TLC=1\r\n\"0\"\n\r\nATOK\r\n"}) {
+        std::string line = want.substr(0, want.find('\r'));
+        EXPECT_EQ(exchange(s, line, want.size()), want);
+    }
+    close(s);
+    int l = d.connect_local();
+    ASSERT_GE(l, 0);
+    EXPECT_EQ(exchange(l, "AT+QXSD=0", 4096), "AT+QXSD=0\r\n\r\nOK\r\n");
+    close(l);
+}
+
+TEST(StorageDaemon, OtgStickFoundAfterTheAnswer) {
+    Sandbox box;
+    Daemon d(box);
+    int s = d.connect_tcp();
+    ASSERT_GE(s, 0);
+    const std::string ok = "AT+QX_OTG_DEV=1,8\r\n\r\nATOK\r\n";
+    EXPECT_EQ(exchange(s, "AT+QX_OTG_DEV=1,8", ok.size()), ok);
+    ASSERT_TRUE(d.wait_prop("sys.otg.dev", "0"));
+    box.write("/sys/kernel/debug/usb/devices", "I:* If#= 0 Alt= 0 #EPs= 2 Cls=08(stor.) Sub=06 Prot=50 Driver=usb-storage\n");
+    ASSERT_TRUE(d.wait_prop("sys.otg.dev", "1", 3000));
+    const std::string found = "AT+QX_OTG_DEV=0\r\n\r\nATOK\r\n";
+    EXPECT_EQ(exchange(s, "AT+QX_OTG_DEV=0", found.size()), found);
+    close(s);
 }
 
 }  // namespace
