@@ -17,6 +17,7 @@
 #include "platform/device.h"
 #include "platform/factory.h"
 #include "platform/sim/cbuf.h"
+#include "platform/sim/processes.h"
 #include "platform/sim/script.h"
 #include "platform/sim/sim.h"
 
@@ -54,22 +55,6 @@ std::string disk_usage(const std::string &device_path) {
             if (it->is_regular_file(ec)) bytes += it->file_size(ec);
     }
     return std::to_string((bytes + 1023) / 1024) + "\t" + device_path + "\n";
-}
-
-// ps: init and ftcmd, then one line for each name in .sim/processes (background programs
-// such as the DDR stress test that the phone is to be seen running).
-std::string process_list() {
-    std::string out = "USER           PID  PPID     VSZ    RSS WCHAN            ADDR S NAME\n"
-                      "root             1     0 10871512  8968 0                   0 S init\n"
-                      "root           612     1 10800160  4436 0                   0 S ftcmd\n";
-    int pid = 3100;
-    for (const auto &name : sim::read_lines(sim::state("processes"))) {
-        if (name.empty() || name[0] == '#') continue;
-        char row[160];
-        snprintf(row, sizeof row, "root         %5d     1  2170416  91124 0                   0 R %s\n", pid++, name.c_str());
-        out += row;
-    }
-    return out;
 }
 
 // btnvtool -b B0.B1.B2.B3.B4.B5 stores the Bluetooth address as item 1 of the
@@ -121,7 +106,7 @@ std::string run_stage(const std::vector<std::string> &w, const std::string &inpu
         return out;
     }
     if (prog == "du" && w.size() >= 2) return disk_usage(w.back());
-    if (prog == "ps") return process_list();
+    if (prog == "ps") return sim::process_list();
     if (prog == "bdt" && w.size() >= 2) {
         // The controller's test mode shows in the property that AT+EMBT=4 reads.
         if (w[1] == "entrydut" || w[1] == "txcontinuous") property_set("bluetooth.bdt.kaeldut", "true");
