@@ -76,8 +76,7 @@ protected:
         box.write("/.sim/nv.bin", nv_pattern());
     }
     void TearDown() override {
-        // The OTG workers cannot be stopped: let them end before the sandbox goes.
-        for (int i = 0; i < 400 && otg_checks_running() > 0; ++i) std::this_thread::sleep_for(std::chrono::milliseconds(25));
+        wait_workers(10000);  // the OTG workers cannot be stopped: they end before the sandbox goes
         is_uart_flag = 0;
         InProcess::TearDown();
     }
@@ -207,7 +206,6 @@ INSTANTIATE_TEST_SUITE_P(Flash, StorageLine, ::testing::Values(
              fs::remove(b.path(kFw));
          },
          "", "OK"},
-    Case{"NoCid", "AT+EMMCFW=0", [](const Sandbox &b) { fs::remove(b.path(kCid)); b.write(kFw, "bad"); }, "", "OK"},
     Case{"", "AT+EMMCFW=1", nullptr, "\"0300\n\"\n", "OK"},
     Case{"Emmc", "AT+EMMCFW=1", [](const Sandbox &b) { fs::remove(b.path(kRev)); }, "\"0x0000001200000000\n\"\n", "OK"},
     Case{"NoNodes", "AT+EMMCFW=1", [](const Sandbox &b) { fs::remove(b.path(kRev)); fs::remove(b.path(kFw)); }, "", "ERROR"},
@@ -224,12 +222,9 @@ INSTANTIATE_TEST_SUITE_P(Ddr, StorageLine, ::testing::Values(
     Case{"", "AT+QXDDR=1,60,1", nullptr, "", "OK", {"shell ps|grep stressapptest", kStress, "sync"}},
     Case{"Running", "AT+QXDDR=1,60,1", [](const Sandbox &b) { b.write("/.sim/processes", "stressapptest\n"); }, "", "OK",
          {"shell ps|grep stressapptest"}, "stressapptest -s"},
-    Case{"OtherProgram", "AT+QXDDR=1,60,1", [](const Sandbox &b) { b.write("/.sim/processes", "memtester\n"); }, "", "OK",
-         {kStress}},
     Case{"Memory8G", "AT+QXDDR=1,3600,0", [](const Sandbox &b) { b.write("/proc/meminfo", "MemTotal:        8388608 kB\n"); },
          "", "OK", {"shell /vendor/bin/stressapptest -s 3600 -M 4096 -W > /data/vendor/last_ddr.txt&\n"}},
     Case{"NoX", "AT+QXDDR=1,60", nullptr, "", "ERROR", {}, "shell"},
-    Case{"NoSeconds", "AT+QXDDR=1", nullptr, "", "ERROR", {}, "shell"},
     Case{"ShellText", "AT+QXDDR=1,60;reboot,1", nullptr, "", "ERROR", {}, "shell"},
     Case{"", "AT+QXDDR=0", nullptr, "\"1\"", "OK"},
     Case{"Passed", "AT+QXDDR=0", [](const Sandbox &b) { b.write(kDdrLog, "Log: Duration 60s\nStatus: PASS - please verify\n"); },
@@ -251,7 +246,6 @@ INSTANTIATE_TEST_SUITE_P(Otg, StorageLine, ::testing::Values(
     Case{"", "AT+QXOTG=1,5", nullptr, "", "OK", {"message otg_test 1 5 -> ok"}},
     Case{"Refused", "AT+QXOTG=1,5", refuse, "", "ERROR", {"message otg_test 1 5 -> error"}},
     Case{"NoX", "AT+QXOTG=1", nullptr, "", "ERROR", {}, "message"},
-    Case{"EmptyX", "AT+QXOTG=1,", nullptr, "", "ERROR", {}, "message"},
     Case{"LongX", "AT+QXOTG=1," + std::string(200, '7'), nullptr, "", "ERROR", {}, "message"},
     Case{"", "AT+QXOTG=0", nullptr, "\r\n\"otg:1\"\r\n", "OK", {"message otg_test 0 -> ok"}},
     Case{"NoHost", "AT+QXOTG=0", [](const Sandbox &b) { b.reply("otg_test 0", "fail"); }, "\r\n\"otg:0\"\r\n", "OK"},
@@ -261,7 +255,6 @@ INSTANTIATE_TEST_SUITE_P(Otg, StorageLine, ::testing::Values(
     Case{"Zero", "AT+QX_OTG_DEV=1,0", nullptr, "\"para error\"", "ATNG", {}, "message"},
     Case{"TooLong", "AT+QX_OTG_DEV=1,601", nullptr, "\"para error\"", "ATNG", {}, "message"},
     Case{"NotANumber", "AT+QX_OTG_DEV=1,5s", nullptr, "\"para error\"", "ATNG", {}, "message"},
-    Case{"NoSeconds", "AT+QX_OTG_DEV=1", nullptr, "\"para error\"", "ATNG", {}, "message"},
     Case{"Refused", "AT+QX_OTG_DEV=1,600", refuse, "\"open otg error\"", "ATNG", {"message otg_test enable -> error"},
          "setprop"},
     Case{"Unset", "AT+QX_OTG_DEV=0", nullptr, "\"-1\"", "ATNG"},
@@ -286,18 +279,19 @@ const std::string kKeyboard = kHub + "\nI:* If#= 0 Alt= 0 #EPs= 1 Cls=03(HID  ) 
 struct OtgRun {
     const char *name;
     int tries;
-    std::vector<std::string> reads;  // the devices node at each read, the last repeating
+    std::vector<std::string> reads;  // the devices node at each read, the last repeating; none: no node
     bool found;
 };
 class OtgWorker : public StorageTest, public ::testing::WithParamInterface<OtgRun> {};
 
 TEST_P(OtgWorker, ReportsThroughItsProperty) {
     const OtgRun &r = GetParam();
-    box.sequence("/sys/kernel/debug/usb/devices", r.reads);
+    if (r.reads.empty()) fs::remove(box.path("/sys/kernel/debug/usb/devices"));
+    else box.sequence("/sys/kernel/debug/usb/devices", r.reads);
     box.set_prop("sys.otg.dev", "-1");
     const std::string line = "AT+QX_OTG_DEV=1," + std::to_string(r.tries);
     EXPECT_EQ(serve(line), line + "\r\n\r\nATOK\r\n");
-    ASSERT_TRUE(wait_workers(r.tries * 1000 + 3000));
+    ASSERT_TRUE(wait_workers(std::min(r.tries, 5) * 1000 + 3000));
     EXPECT_EQ(box.prop("sys.otg.dev"), r.found ? "1" : "0");
     EXPECT_EQ(serve("AT+QX_OTG_DEV=0"), r.found ? "AT+QX_OTG_DEV=0\r\n\r\nATOK\r\n" : "AT+QX_OTG_DEV=0\r\n\"0\"\r\nATNG\r\n");
     long long cleared = -1, set = -1;
@@ -321,15 +315,9 @@ INSTANTIATE_TEST_SUITE_P(Storage, OtgWorker, ::testing::Values(
     OtgRun{"StickOnThirdTry", 3, {kHub, kHub, kStick}, true},
     OtgRun{"KeyboardOnSecondTry", 10, {kHub, kKeyboard}, true},
     OtgRun{"StickAfterTheLastTry", 2, {kHub, kHub, kStick}, false},
+    OtgRun{"NoUsbNode", 600, {}, false},  // ends at its first try, not after 600
     OtgRun{"OtherDevice", 2, {kHub + "\nI:* If#= 0 Alt= 0 #EPs= 3 Cls=ff(vend.) Driver=r8152"}, false}),
     [](const ::testing::TestParamInfo<OtgRun> &info) { return std::string(info.param.name); });
-
-TEST_F(StorageTest, OtgWorkerEndsWhenTheUsbNodeIsMissing) {
-    fs::remove(box.path("/sys/kernel/debug/usb/devices"));
-    EXPECT_EQ(serve("AT+QX_OTG_DEV=1,600"), "AT+QX_OTG_DEV=1,600\r\n\r\nATOK\r\n");
-    ASSERT_TRUE(wait_workers(5000));  // not 600 tries
-    EXPECT_EQ(box.prop("sys.otg.dev"), "0");
-}
 
 // A stress test counts as running for its seconds after its start: a second start within
 // them is refused by the process list, one after them starts the program again.
@@ -351,14 +339,6 @@ TEST_F(StorageTest, DdrStressStartsAgainOnlyAfterItsSeconds) {
     std::vector<long long> at = starts();
     ASSERT_EQ(at.size(), 2u) << box.events();
     EXPECT_GE(at[1] - at[0], 1000);
-}
-
-TEST_F(StorageTest, DdrStressSeenRunningByItsName) {
-    box.sequence("shell:ps|grep stressapptest", {"(empty)", "root  3100  1  2170416 91124 0  0 R stressapptest"});
-    EXPECT_EQ(serve("AT+QXDDR=1,60,1"), "AT+QXDDR=1,60,1\r\n\r\nOK\r\n");
-    box.write("/.sim/events.log", "");  // what the second line does, alone
-    EXPECT_EQ(serve("AT+QXDDR=1,60,1"), "AT+QXDDR=1,60,1\r\n\r\nOK\r\n");
-    EXPECT_EQ(box.events(), "shell ps|grep stressapptest\n");
 }
 
 // Over the daemon's own transports: the bodies that end in a bare CR or LF leave as they
