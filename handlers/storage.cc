@@ -133,7 +133,8 @@ int ddr_start(char *cmd) {
     size_t c1 = line.find(','), c2 = c1 == std::string_view::npos ? c1 : line.find(',', c1 + 1);
     std::string_view secs = c2 == std::string_view::npos ? std::string_view{} : line.substr(c1 + 1, c2 - c1 - 1);
     bool third = c2 != std::string_view::npos && line.find_first_not_of(',', c2) != std::string_view::npos;
-    bool digits = !secs.empty() && secs.size() <= kDdrSecondsMax && secs.find_first_not_of("0123456789") == std::string_view::npos;
+    bool digits = !secs.empty() && secs.size() <= kDdrSecondsMax &&
+                  secs.find_first_not_of("0123456789") == std::string_view::npos;
     if (!third || !digits) {
         LOGE("parameter error");
         return RC_ERROR;
@@ -145,7 +146,8 @@ int ddr_start(char *cmd) {
         return RC_OK;
     }
     // Half of the memory in megabytes: the rest is left to the system while it runs.
-    long long megabytes = static_cast<long long>(dev::sysconf(_SC_PHYS_PAGES)) * dev::sysconf(_SC_PAGESIZE) / 0x200000;
+    long long bytes = static_cast<long long>(dev::sysconf(_SC_PHYS_PAGES)) * dev::sysconf(_SC_PAGESIZE);
+    long long megabytes = bytes / 0x200000;
     char command[256];
     snprintf(command, sizeof command, "/vendor/bin/stressapptest -s %.*s -M %lld -W > %s&", static_cast<int>(secs.size()),
              secs.data(), megabytes, kDdrLog);
