@@ -14,6 +14,7 @@
 #include <cstring>
 #include <string_view>
 #include <thread>
+#include <vector>
 
 #include <android-base/parseint.h>
 
@@ -129,13 +130,11 @@ LifeNodes life_nodes() {
 
 int ddr_start(char *cmd) {
     // Fields: "AT+QXDDR=1", the seconds, and one more that the station always sends.
-    std::string_view line(cmd);
-    size_t c1 = line.find(','), c2 = c1 == std::string_view::npos ? c1 : line.find(',', c1 + 1);
-    std::string_view secs = c2 == std::string_view::npos ? std::string_view{} : line.substr(c1 + 1, c2 - c1 - 1);
-    bool third = c2 != std::string_view::npos && line.find_first_not_of(',', c2) != std::string_view::npos;
+    std::vector<std::string_view> fields = comma_fields(cmd);
+    std::string_view secs = fields.size() >= 3 ? fields[1] : std::string_view{};
     bool digits = !secs.empty() && secs.size() <= kDdrSecondsMax &&
                   secs.find_first_not_of("0123456789") == std::string_view::npos;
-    if (!third || !digits) {
+    if (!digits) {
         LOGE("parameter error");
         return RC_ERROR;
     }
