@@ -319,6 +319,8 @@ protected:
     // Stream texts until n arrived or ms passed.
     std::vector<std::string> texts(size_t n, int ms) {
         std::vector<std::string> out;
+        split(carry, out);
+        carry.clear();
         auto end = Clock::now() + std::chrono::milliseconds(ms);
         do split(answer(64, 20), out);
         while (out.size() < n && Clock::now() < end);
@@ -330,7 +332,8 @@ protected:
         char buf[kLineSize] = {0};
         line.copy(buf, kLineSize - 1);
         dispatch_command(buf, static_cast<int>(line.size()) + 1, SRC_TCP);
-        std::string data = answer(4096);
+        std::string data = carry + answer(4096);
+        carry.clear();
         const std::string want = frame(line, "", "OK");
         size_t at = data.find(want);
         EXPECT_NE(at, std::string::npos) << data;
@@ -358,7 +361,14 @@ protected:
         for (const std::string &t : texts(100, 0)) late.push_back(t);
         return late;
     }
-    std::string start() { return serve("AT+QXZLJC=0,1", SRC_TCP, frame("AT+QXZLJC=0,1", "", "OK").size()); }
+    // The start's frame; a reading that came in the same read is kept for texts().
+    std::string start() {
+        const size_t n = frame("AT+QXZLJC=0,1", "", "OK").size();
+        std::string got = serve("AT+QXZLJC=0,1", SRC_TCP, n);
+        carry = got.size() > n ? got.substr(n) : "";
+        return got.substr(0, n);
+    }
+    std::string carry;
 };
 
 TEST_F(StreamTest, SendsZEveryPeriodUntilStopped) {
@@ -421,7 +431,8 @@ TEST(SensorsDaemon, ZStreamOverTcp) {
     ASSERT_TRUE(d.wait_prop("sys.qrcode.view", "0"));
     const std::string ok = "AT+QXZLJC=0,1\r\n\r\nOK\r\n", z = "\r\n10";
     auto t0 = Clock::now();
-    EXPECT_EQ(exchange(s, "AT+QXZLJC=0,1", ok.size() + 6 * z.size()), ok + z + z + z + z + z + z);
+    const std::string six = ok + z + z + z + z + z + z;
+    EXPECT_EQ(exchange(s, "AT+QXZLJC=0,1", six.size()).substr(0, six.size()), six);  // a seventh may follow
     // The answer first, a reading at once, then one each period: five periods in all.
     auto ms = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - t0).count();
     EXPECT_GE(ms, 1000);
