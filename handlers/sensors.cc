@@ -290,10 +290,7 @@ int answer_property(const char *name, char *resp) {
 
 void *update_gsensor_z_thread(void *) {
     LOGI("start");
-    // The first reading waits until the answer of the line that started the stream has
-    // left (the dispatcher holds its mutex until then), so the station sees OK first.
-    pthread_mutex_lock(&g_port.mutex);
-    pthread_mutex_unlock(&g_port.mutex);
+    wait_for_current_answer();
     while (g_gsensor_stream.load() == 1) {
         ResultPtr r = new_result();
         if (!r) {
