@@ -478,4 +478,74 @@ TEST_F(AudioTest, CalibrationWorkerAnswersAtOnceAndCalibratesBehind) {
                                    "message speakerld 0 -> ok", kCalItem + "1 uart=0"});
 }
 
+// ---- over the daemon's transports
+
+// TCP stations send their lines bare; the daemon answers each with one frame.
+std::string exchange(int fd, const std::string &line, const std::string &want) {
+    send(fd, line.data(), line.size(), MSG_NOSIGNAL);
+    return read_some(fd, want.size());
+}
+
+bool wait_events(const Sandbox &box, const std::string &text, int ms = 5000) {
+    for (int waited = 0; waited < ms; waited += 20) {
+        if (box.events().find(text) != std::string::npos) return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    }
+    return false;
+}
+
+TEST(AudioDaemon, StationThatHangsUpClosesTheOpenLoopback) {
+    Sandbox box;
+    Daemon d(box);
+    int s = d.connect_tcp();
+    ASSERT_GE(s, 0);
+    ASSERT_TRUE(d.wait_prop("sys.qrcode.view", "0"));
+    const std::string open = "AT+QXMT=0,1\r\n\r\nOK\r\n";
+    EXPECT_EQ(exchange(s, "AT+QXMT=0,1", open), open);
+    close(s);
+    // The hang-up line closes whatever is open, here the receive loopback.
+    ASSERT_TRUE(wait_events(box, "audio exitSendTest() -> 0")) << box.events();
+    EXPECT_EQ(box.prop("sys.qrcode.view"), "1");
+    int s2 = d.connect_tcp();
+    ASSERT_GE(s2, 0);
+    const std::string reclose = "AT+QXMT=0,0\r\n\r\nATOK\r\n";
+    EXPECT_EQ(exchange(s2, "AT+QXMT=0,0", reclose), reclose);
+    close(s2);
+    EXPECT_EQ(audio_calls(box.events()), (std::vector<std::string>{"init_ftm", "startReceiveTest(100) -> 0", "exitSendTest() -> 0"}));
+}
+
+TEST(AudioDaemon, RecordingWorkerRefusesAPartOfANameAndRecordsAWholeOne) {
+    Sandbox box;
+    Daemon d(box);
+    int s = d.connect_tcp();
+    ASSERT_GE(s, 0);
+    const std::string part = "AT+QX_AUD_RECD=0,Mic,0.1\r\n\r\nATOK\r\n";
+    EXPECT_EQ(exchange(s, "AT+QX_AUD_RECD=0,Mic,0.1", part), part);
+    EXPECT_TRUE(d.wait_log("parameter error!!"));
+    const std::string whole = "AT+QX_AUD_RECD=0,HPMic,0.2\r\n\r\nATOK\r\n";
+    EXPECT_EQ(exchange(s, "AT+QX_AUD_RECD=0,HPMic,0.2", whole), whole);
+    EXPECT_TRUE(d.wait_log("HPMic record finished!!"));
+    const std::string done = "AT+QX_AUD_RECD=1,HPMic\r\n\"1\"\r\nATOK\r\n";
+    EXPECT_EQ(exchange(s, "AT+QX_AUD_RECD=1,HPMic", done), done);
+    close(s);
+    // Only the whole name reached the recorder; the part was refused before the library.
+    EXPECT_EQ(audio_calls(box.events()),
+              (std::vector<std::string>{"init_ftm", "audio_ftm_process(54,1,100) -> 0", "audio_ftm_process(54,0,0) -> 0"}));
+    expect_in_order(box.events(), {"message set_silent_mode 0 -> ok", "message set_silent_mode 0 -> ok",
+                                   "setprop sys.is_audio_working.hp_mic=1", "message set_silent_mode 1 -> ok"});
+}
+
+TEST(AudioDaemon, CalibrationWorkerRunsAfterTheAnswerHasLeft) {
+    Sandbox box;
+    script(box, "smartpa_calibrate_ms=600");
+    Daemon d(box);
+    int s = d.connect_local();
+    ASSERT_GE(s, 0);
+    const std::string answer = "AT+ZNGF=5\r\n\r\nOK\r\n";
+    EXPECT_EQ(exchange(s, "AT+ZNGF=5", answer), answer);
+    close(s);
+    EXPECT_EQ(box.events().find("calibrate smart_speaker_amplifier_cali"), std::string::npos);
+    ASSERT_TRUE(wait_events(box, "calibrate smart_speaker_amplifier_cali=1 uart=0")) << box.events();
+}
+
 }  // namespace
