@@ -7,6 +7,7 @@
 // (audio_recorder.cc).
 #include <chrono>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <string>
 #include <thread>
@@ -35,8 +36,10 @@ bool amplifier_absent() { return sim::fault("audio") || sim::fault("smartpa"); }
 int ftm(const char *name, int test_case, int enable, int volume, const char *path) {
     std::string args = num(test_case) + "," + num(enable) + "," + num(volume) + (path ? std::string(",") + path : "");
     std::string key = "ftm." + num(test_case);
-    long rc_start = scripted(key.c_str(), 0);
-    int rc = sim::fault("audio") ? -1 : static_cast<int>(enable ? rc_start : scripted((key + ".stop").c_str(), rc_start));
+    // One script read per call, so a sequence of results advances once per call.
+    std::string stop = enable ? "" : sim::script_text(sim::state("audio"), key + ".stop", "");
+    long scripted_rc = stop.empty() ? scripted(key.c_str(), 0) : strtol(stop.c_str(), nullptr, 10);
+    int rc = sim::fault("audio") ? -1 : static_cast<int>(scripted_rc);
     if (rc == 0 && enable && path && *path && !dev::exists(path)) rc = 2;  // nothing to play
     sim::record("audio", std::string(name) + "(" + args + ") -> " + num(rc));
     if (rc == 0 && sim::recorder_file(test_case)) {

@@ -40,6 +40,13 @@ std::vector<std::string> audio_calls(const std::string &log) {
     return calls;
 }
 
+// The time stamp of the first event of kind whose detail starts with detail; -1 if none.
+long long event_ms(const Sandbox &box, const std::string &kind, const std::string &detail) {
+    for (const Event &e : box.event_list())
+        if (e.kind == kind && e.detail.rfind(detail, 0) == 0) return e.ms;
+    return -1;
+}
+
 void expect_in_order(const std::string &log, const std::vector<std::string> &texts) {
     size_t at = 0;
     for (const auto &t : texts) {
@@ -415,6 +422,13 @@ TEST_F(AudioTest, RecordingRunsItsTimeThenReportsDone) {
                                     "setprop sys.is_audio_working.main_mic=1", "audio audio_ftm_process(51,0,0) -> 0",
                                     "recorder stop /sdcard/engineermode/main-record.wav",
                                     "setprop sys.is_audio_working.main_mic=0", "message set_silent_mode 1 -> ok"});
+    // Recorded from the busy mark until the poll that found the time up: 300 ms and at
+    // most one poll late, with room for a loaded machine.
+    long long busy = event_ms(box, "setprop", std::string(kMainBusy) + "=1");
+    long long stop = event_ms(box, "audio", "audio_ftm_process(51,0,0)");
+    ASSERT_GE(busy, 0);
+    EXPECT_GE(stop - busy, 300);
+    EXPECT_LE(stop - busy, 1300);
     // The take holds at least the asked time of 8 kHz 16-bit samples.
     EXPECT_GE(box.read(kMainFile).size(), 44u + 300 * 16);
     EXPECT_EQ(serve("AT+QX_AUD_RECD=1,MainMic"), "AT+QX_AUD_RECD=1,MainMic\r\n\"1\"\r\nATOK\r\n");
@@ -428,6 +442,11 @@ TEST_F(AudioTest, StopFormEndsARunningRecordingAtItsNextPoll) {
     EXPECT_EQ(serve("AT+QX_AUD_RECD=1,SubMic"), "AT+QX_AUD_RECD=1,SubMic\r\n\"0\"\r\nATOK\r\n");
     EXPECT_EQ(serve("AT+QX_AUD_RECD=3,SubMic"), "AT+QX_AUD_RECD=3,SubMic\r\n\r\nATOK\r\n");
     ASSERT_TRUE(wait_event("message set_silent_mode 1", 3000)) << box.events();
+    // The worker polls every 10 ms: the stop follows the cleared mark at once, not after 30 s.
+    long long cleared = event_ms(box, "setprop", std::string(kSubBusy) + "=0");
+    long long stop = event_ms(box, "audio", "audio_ftm_process(52,0,0)");
+    EXPECT_GE(stop, cleared);
+    EXPECT_LE(stop - cleared, 1000);
     EXPECT_EQ(serve("AT+QX_AUD_RECD=1,SubMic"), "AT+QX_AUD_RECD=1,SubMic\r\n\"1\"\r\nATOK\r\n");
     EXPECT_EQ(box.events().find("set_silent_mode 0"), std::string::npos);  // the "=2" form sends none
 }
@@ -477,6 +496,49 @@ TEST_F(AudioTest, CalibrationWorkerAnswersAtOnceAndCalibratesBehind) {
     expect_in_order(box.events(), {"message speakerld 2 -> ok", "audio " + kMaker0, "audio " + kCalOk,
                                    "message speakerld 0 -> ok", kCalItem + "1 uart=0"});
 }
+
+// ---- results that change between calls, and the amplifier's settle time
+
+TEST_F(AudioTest, HeadsetPluggedBetweenTwoQueries) {
+    box.sequence("audio:hp_type", {"0", "1"});
+    EXPECT_EQ(serve("AT+QX_AUD_EAR=2"), "AT+QX_AUD_EAR=2\r\n\"3\"\r\nATOK\r\n");
+    EXPECT_EQ(serve("AT+QX_AUD_EAR=2"), "AT+QX_AUD_EAR=2\r\n\"1\"\r\nATOK\r\n");
+}
+
+TEST_F(AudioTest, FailedSendLoopbackIsRetriedOnlyAfterAClose) {
+    box.sequence("audio:startSendTest", {"-1", "0"});
+    EXPECT_EQ(serve("AT+QXMT=1,1"), "AT+QXMT=1,1\r\n\r\nERROR\r\n");
+    EXPECT_EQ(serve("AT+QXMT=1,1"), "AT+QXMT=1,1\r\n\r\nATOK\r\n");
+    EXPECT_EQ(serve("AT+QXMT=1,0"), "AT+QXMT=1,0\r\n\r\nOK\r\n");
+    EXPECT_EQ(serve("AT+QXMT=1,1"), "AT+QXMT=1,1\r\n\r\nOK\r\n");
+    EXPECT_EQ(audio_calls(box.events()),
+              (std::vector<std::string>{"startSendTest(100) -> -1", "exitSendTest() -> 0", "startSendTest(100) -> 0"}));
+}
+
+TEST_F(AudioTest, CalibrationWaitsForTheTestAppTone) {
+    box.sequence("testapp:speakerld 2", {"busy", "ok"});
+    EXPECT_EQ(serve("AT+ZNGF=0"), "AT+ZNGF=0\r\n\"start audio fail\"\r\nERROR\r\n");
+    EXPECT_EQ(serve("AT+ZNGF=0"), "AT+ZNGF=0\r\n\r\nOK\r\n");
+    EXPECT_EQ(audio_calls(box.events()), (std::vector<std::string>{kMaker0, kCalOk}));
+}
+
+class AmplifierSettle : public AudioTest, public ::testing::WithParamInterface<int> {};
+
+TEST_P(AmplifierSettle, MakersOneAndTwoWaitHalfASecond) {
+    const int maker = GetParam();
+    script(box, "smartpa_manufacturer=" + std::to_string(maker));
+    EXPECT_EQ(serve("AT+ZNGF=apk"), "AT+ZNGF=apk\r\nR0=7.21ohm F0=812Hz\r\nOK\r\n");
+    long long asked = event_ms(box, "audio", "get_smartpa_manufacturer()");
+    long long calibrated = event_ms(box, "audio", "smartpa_calibrate()");
+    ASSERT_GE(asked, 0);
+    if (maker == 1 || maker == 2)
+        EXPECT_GE(calibrated - asked, 500);
+    else
+        EXPECT_LT(calibrated - asked, 500);
+}
+
+INSTANTIATE_TEST_SUITE_P(Audio, AmplifierSettle, ::testing::Values(0, 1, 2, 3),
+                         [](const ::testing::TestParamInfo<int> &i) { return "Maker" + std::to_string(i.param); });
 
 // ---- over the daemon's transports
 
