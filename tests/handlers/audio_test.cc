@@ -89,6 +89,7 @@ protected:
         InProcess::SetUp();
         g_audio_test_state = 0;
         box.write("/.sim/nv.bin", nv_pattern());
+        box.write(kTone, "RIFF");
     }
     void TearDown() override {
         g_audio_test_state = 0;
@@ -117,6 +118,9 @@ struct Case {
     std::vector<std::string> effects = {};  // other events, in order
     std::vector<std::pair<const char *, const char *>> props = {};
 };
+
+// ctest lists a case by its line, not by its bytes.
+void PrintTo(const Case &c, std::ostream *os) { *os << c.line << (*c.tag ? " (" : "") << c.tag << (*c.tag ? ")" : ""); }
 
 class AudioLine : public AudioTest, public ::testing::WithParamInterface<Case> {};
 
