@@ -359,7 +359,8 @@ int speaker_amplifier_calibrate(char *text, size_t size) {
 
 void set_amplifier_items(const char *state) {
     set_calibrate_item_state(kAmplifierItem, state, is_uart_flag);
-    if (is_calibrate_item_support(kSubAmplifierSupport) == 1) set_calibrate_item_state(kSubAmplifierItem, state, is_uart_flag);
+    if (is_calibrate_item_support(kSubAmplifierSupport) == 1)
+        set_calibrate_item_state(kSubAmplifierItem, state, is_uart_flag);
 }
 
 // The whole line calibration: the test app plays the calibration tone around it.

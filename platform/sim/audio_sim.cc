@@ -119,8 +119,9 @@ int smartpa_calibrate(char *text, int len) {
     long ms = scripted("smartpa_calibrate_ms", 0);
     if (ms > 0 && !amplifier_absent()) std::this_thread::sleep_for(std::chrono::milliseconds(ms < 60000 ? ms : 60000));
     int rc = amplifier_absent() ? -1 : static_cast<int>(scripted("smartpa_calibrate", 0));
+    const char *plain = rc == 0 ? "calibrate ok" : "calibrate fail";
     std::string result = amplifier_absent() ? "smartpa not found"
-                         : sim::script_text(sim::state("audio"), "smartpa_calibrate_text", rc == 0 ? "calibrate ok" : "calibrate fail");
+                                            : sim::script_text(sim::state("audio"), "smartpa_calibrate_text", plain);
     if (text && len > 0) snprintf(text, static_cast<size_t>(len), "%s", result.c_str());
     sim::record("audio", "smartpa_calibrate() -> " + num(rc));
     return rc;
