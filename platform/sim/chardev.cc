@@ -27,11 +27,13 @@ namespace sim {
 
 // The device models, one file each. A new model adds its line here.
 extern const DeviceModel kInputEventModel;
+extern const DeviceModel kSideKeyModel;
 
 namespace {
 
 const DeviceModel *const kModels[] = {
     &kInputEventModel,
+    &kSideKeyModel,
 };
 
 struct Session {
@@ -266,6 +268,25 @@ bool device_ioctl(int fd, unsigned long request, void *arg, int *result) {
         t_in_model = was;
         err = errno;
     }
+    lk.unlock();
+    if (*result < 0) errno = err;
+    return true;
+}
+
+bool device_read(int fd, void *buf, size_t len, ssize_t *result) {
+    std::unique_lock<std::recursive_mutex> lk(g_mu);
+    auto at = g_by_fd.find(fd);
+    if (at == g_by_fd.end()) return false;
+    struct stat st {};
+    if (fstat(fd, &st) != 0 || st.st_ino != at->second->client_ino || st.st_dev != at->second->client_dev) return false;
+    Session *s = at->second;
+    if (s->node || s->model->read == nullptr) return false;
+    errno = 0;
+    bool was = t_in_model;
+    t_in_model = true;
+    *result = s->model->read(s->dev, buf, len);
+    t_in_model = was;
+    int err = errno;
     lk.unlock();
     if (*result < 0) errno = err;
     return true;

@@ -61,6 +61,10 @@ struct DeviceModel {
     // The result of ioctl(); -1 with errno set refuses. Unset: every ioctl fails ENOTTY.
     int (*ioctl)(Device &d, unsigned long request, void *arg) = nullptr;
     void (*close)(Device &d) = nullptr;
+    // A read the model answers itself, with the caller's buffer, for drivers that take a
+    // register number from the buffer's first byte (dev::read only). Unset: a read returns
+    // what the model sent.
+    ssize_t (*read)(Device &d, void *buf, size_t len) = nullptr;
     // Attribute nodes the model owns, by device path, and the writes the daemon makes to them.
     bool (*owns)(const std::string &path) = nullptr;
     void (*node_write)(const std::string &path, const std::string &data) = nullptr;
@@ -84,6 +88,9 @@ int device_open(const char *device_path, int flags);
 // dev::ioctl on a descriptor of an emulated device: true with *result set; false when fd
 // is no such descriptor.
 bool device_ioctl(int fd, unsigned long request, void *arg, int *result);
+// dev::read on a descriptor of an emulated device whose model answers reads itself: true
+// with *result set; false when fd is no such descriptor (the read goes to the socket).
+bool device_read(int fd, void *buf, size_t len, ssize_t *result);
 // True when a model owns the attribute node.
 bool node_owned(const char *device_path);
 // Waits (bounded) until every write to an owned node has reached its model.

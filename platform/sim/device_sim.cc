@@ -203,7 +203,11 @@ int chown(const char *p, uid_t owner, gid_t group) {
 
 namespace dev {
 
-ssize_t read(int fd, void *buf, size_t len) { return ::read(fd, buf, len); }
+ssize_t read(int fd, void *buf, size_t len) {
+    ssize_t result = 0;
+    if (sim::device_read(fd, buf, len, &result)) return result;
+    return ::read(fd, buf, len);
+}
 ssize_t write(int fd, const void *buf, size_t len) { return ::write(fd, buf, len); }
 
 }  // namespace dev

@@ -9,6 +9,7 @@
 
 #include "core/input_events.h"
 #include "platform/sim/chardev.h"
+#include "tests/support/daemon.h"
 #include "tests/support/in_process.h"
 
 namespace {
@@ -320,3 +321,72 @@ TEST_F(Keys, PressureKeysAgainstTheVibratorTrigger) {
 }
 
 }  // namespace
+
+namespace {
+
+// The side-key controller's version: 0x0A wakes it, register 0x10 gives four bytes.
+struct VersionCase {
+    const char *name;
+    std::string script;  // .sim/sidekey
+    const char *fault;
+    bool no_device;
+    std::string body;
+    const char *word;
+};
+class SideKeyVersion : public Keys, public ::testing::WithParamInterface<VersionCase> {};
+
+TEST_P(SideKeyVersion, Answer) {
+    const VersionCase &c = GetParam();
+    box.write("/.sim/sidekey", c.script);
+    if (c.fault) box.fault(c.fault);
+    if (c.no_device) std::filesystem::remove(box.path("/dev/ndt"));
+    box.write("/.sim/events.log", "");
+    EXPECT_EQ(answer_of("AT+QX_KEY_CHK=0", c.body, c.word), frame("AT+QX_KEY_CHK=0", c.body, c.word));
+    if (std::string(c.word) == "ATOK") {
+        const std::string log = box.events();
+        size_t at = 0;
+        // The wake command reaches the model on its own thread: only the reads are in order.
+        for (int waited = 0; waited < 2000 && box.events().find("sidekey write 0a\n") == std::string::npos; waited += 20)
+            std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        EXPECT_NE(box.events().find("sidekey write 0a\n"), std::string::npos);
+        for (const char *t : {"sidekey read reg=10", "sidekey read reg=04", "sidekey read reg=4e"}) {
+            at = log.find(t, at);
+            ASSERT_NE(at, std::string::npos) << t << "\n" << log;
+        }
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Keys, SideKeyVersion, ::testing::Values(
+    VersionCase{"Default", "version=01 02 03 2d\n", nullptr, false, "\"74541\"", "ATOK"},
+    VersionCase{"HighNibblesIgnored", "version=f1 e2 d3 ff\n", nullptr, false, "\"74751\"", "ATOK"},
+    VersionCase{"WrongCount", "version=01 02 03 2d\nversion_count=4\n", nullptr, false, "\"-1\"", "ATNG"},
+    VersionCase{"ReadFails", "", "sidekey", false, "\"-1\"", "ATNG"},
+    VersionCase{"NoDevice", "", nullptr, true, "\"-1\"", "ATNG"}),
+    [](const auto &i) { return std::string(i.param.name); });
+
+}  // namespace
+
+// A station presses keys on a running phone and reads them back over TCP.
+TEST(KeysDaemon, KeysPressedOnTheRunningPhoneAreAnswered) {
+    Sandbox box;
+    Daemon d(box);
+    int s = d.connect_tcp();
+    ASSERT_GE(s, 0);
+    auto exchange = [&](const std::string &line, const std::string &want) {
+        send(s, line.data(), line.size(), MSG_NOSIGNAL);
+        return read_some(s, want.size());
+    };
+    const std::string started = frame("AT+QXKEY=1", "", "OK");
+    ASSERT_EQ(exchange("AT+QXKEY=1", started), started);
+    std::string want;
+    for (auto [code, letter] : {std::pair{114, '-'}, {116, 'P'}, {115, '+'}}) {
+        // The daemon opened the devices before it answered: the station's FIFO is there.
+        ASSERT_TRUE(sim::station_send(box.root, "input key " + std::to_string(code) + " click")) << strerror(errno);
+        want += letter;
+        for (int waited = 0; waited < 3000 && box.read(kKeyCaptureFile) != want; waited += 20)
+            std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    }
+    const std::string keys = frame("AT+QXKEY=0", "\r\n\"-P+\"\r\n", "OK");
+    EXPECT_EQ(exchange("AT+QXKEY=0", keys), keys);
+    close(s);
+}
