@@ -11,6 +11,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
@@ -113,4 +114,28 @@ int Daemon::stop(int sig) {
     waitpid(pid, &status, 0);
     pid = -1;
     return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}
+
+Pty::Pty(const Sandbox &box, const char *device) {
+    master = posix_openpt(O_RDWR | O_NOCTTY);
+    if (master < 0 || grantpt(master) != 0 || unlockpt(master) != 0) throw std::runtime_error("no pty");
+    slave = ptsname(master);
+    std::filesystem::create_directories(std::filesystem::path(box.path(device)).parent_path());
+    std::filesystem::create_symlink(slave, box.path(device));
+    keep = open(slave.c_str(), O_RDWR | O_NOCTTY);
+}
+
+Pty::~Pty() {
+    close(keep);
+    close(master);
+}
+
+bool Pty::send(const std::string &s) const { return write(master, s.data(), s.size()) == static_cast<ssize_t>(s.size()); }
+
+speed_t Pty::speed() const {
+    int fd = open(slave.c_str(), O_RDWR | O_NOCTTY);
+    struct termios t {};
+    tcgetattr(fd, &t);
+    close(fd);
+    return cfgetospeed(&t);
 }

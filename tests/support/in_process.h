@@ -41,7 +41,7 @@ protected:
                     : src == SRC_LOCAL ? &g_port.local_client_fd
                                        : &g_port.tcp_client_fd;
         *slot = sv[1];
-        g_port.source_type = src;
+        force_current_source(src);
     }
 
     // Dispatches a received line as its transport would hand it over.
