@@ -55,7 +55,9 @@ Daemon::Daemon(const Sandbox &b, const std::string &cmdline, bool wait_ready) : 
         setenv("FTCMD_TCP_PORT", std::to_string(port).c_str(), 1);
         setenv("FTCMD_LOCAL_SOCKET", local_name.c_str(), 1);
         setenv("FTCMD_SIM_LISTEN", "127.0.0.1", 1);
-        execl(FTCMD_BIN, "ftcmd", static_cast<char *>(nullptr));
+        // Another build of the daemon can be measured against this one (benchmarks).
+        const char *bin = getenv("FTCMD_DAEMON_BIN");
+        execl(bin != nullptr ? bin : FTCMD_BIN, "ftcmd", static_cast<char *>(nullptr));
         _exit(127);
     }
     if (wait_ready && !wait_prop("sys.qrcode.view", "1")) throw std::runtime_error("daemon did not come up");
