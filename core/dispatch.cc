@@ -66,7 +66,7 @@ int search_command_table(const CommandEntry *table, std::size_t rows, char *line
         if (strncmp(name, row.name, sizeof row.name) != 0) continue;
         char resp[kRespSize] = {0};
         char copy[kLineSize] = {0};
-        strncpy(copy, line, kLineSize - 1);
+        memcpy(copy, line, strnlen(line, kLineSize - 1));  // at most 2048 characters
         int rc = row.handler(copy, static_cast<int>(row.arg), resp);
         if (rc == RC_DECLINE) return 0;
         writeDataToserialByResponseType(line, resp, rc);
