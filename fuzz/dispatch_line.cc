@@ -10,6 +10,7 @@
 
 #include "core/dispatch.h"
 #include "core/port_state.h"
+#include "core/workers.h"
 #include "tests/support/sandbox.h"
 
 namespace {
@@ -28,6 +29,8 @@ struct Phone {
         g_port.uart_fd = g_port.usb_fd = g_port.tcp_client_fd = sv[1];
     }
     ~Phone() {
+        // Workers the handlers started act on the sandbox: they finish before it goes.
+        wait_workers_done(15000);
         close(station);
         close(g_port.tcp_client_fd);
     }
