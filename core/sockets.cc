@@ -38,6 +38,7 @@ void set_flag(int fd, int level, int opt, const char *what) {
 }
 
 void close_tcp_client() {
+    tcp_station_dropped(g_port.tcp_client_fd);  // a drop pending for it is done with
     close(g_port.tcp_client_fd);
     g_port.tcp_client_fd = -1;  // a stale number must never reach a reused descriptor
 }
