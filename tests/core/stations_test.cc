@@ -122,7 +122,10 @@ protected:
     void expect_usb_answered(const std::string &line) {
         auto start = Clock::now();
         ASSERT_TRUE(usb.send(line + "\r"));
-        EXPECT_EQ(read_some(usb.master, line.size() + kNotSupported.size(), 6000), line + kNotSupported);
+        // The hang-up line of a dropped TCP station may follow: it answers on whatever
+        // source was served last.
+        std::string want = line + kNotSupported;
+        EXPECT_EQ(read_some(usb.master, want.size(), 6000).substr(0, want.size()), want);
         EXPECT_LT(seconds_since(start), 6.0) << "the USB station waited too long";
     }
 };
