@@ -60,7 +60,10 @@ Daemon::Daemon(const Sandbox &b, const std::string &cmdline, bool wait_ready) : 
         execl(bin != nullptr ? bin : FTCMD_BIN, "ftcmd", static_cast<char *>(nullptr));
         _exit(127);
     }
-    if (wait_ready && !wait_prop("sys.qrcode.view", "1")) throw std::runtime_error("daemon did not come up");
+    if (wait_ready && !wait_prop("sys.qrcode.view", "1")) {
+        stop(SIGKILL);  // no destructor runs for a half-made daemon: end it here
+        throw std::runtime_error("daemon did not come up");
+    }
 }
 
 Daemon::~Daemon() {
