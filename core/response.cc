@@ -37,10 +37,14 @@ constexpr int kWriteLimitMs = 2000;
 // delete the file that the other has just switched to.
 std::mutex g_log_lock;
 
-// One writer at a time on the serial ports, so that toggling a descriptor's blocking
-// mode for a bounded write cannot be undone under another writer's feet.
-std::mutex g_serial_out;
-bool g_serial_stalled[2];  // UART, USB: the last write timed out
+// One writer at a time on each serial port (a worker's frames and the dispatcher's),
+// so that toggling a descriptor's blocking mode for a bounded write cannot be undone
+// under another writer's feet. The stall mark belongs to the same port.
+struct SerialOut {
+    std::mutex lock;
+    bool stalled = false;  // the last write timed out
+};
+SerialOut g_serial_out[2];  // UART, USB
 
 using Clock = std::chrono::steady_clock;
 
@@ -60,8 +64,9 @@ void wait_writable(int fd, int timeout_ms) {
 // Writes all of data within the limit: the count written, or -1 when nothing was. A port
 // whose last write timed out gets no fresh wait until it takes output again, so a stopped
 // station costs the others one wait, not one per line.
-ssize_t write_serial_bounded(int fd, const char *data, size_t len, bool *stalled) {
-    std::lock_guard<std::mutex> hold(g_serial_out);
+ssize_t write_serial_bounded(int fd, const char *data, size_t len, SerialOut &out) {
+    std::lock_guard<std::mutex> hold(out.lock);
+    bool *stalled = &out.stalled;
     int flags = fcntl(fd, F_GETFL);
     if (flags < 0) return -1;
     fcntl(fd, F_SETFL, flags | O_NONBLOCK);
@@ -156,8 +161,8 @@ void save_command(const char *data, size_t len) {
     }
 }
 
-void write_serial(int fd, const char *data, int len, const char *what, bool *stalled) {
-    ssize_t n = write_serial_bounded(fd, data, static_cast<size_t>(len), stalled);
+void write_serial(int fd, const char *data, int len, const char *what, SerialOut &out) {
+    ssize_t n = write_serial_bounded(fd, data, static_cast<size_t>(len), out);
     if (n < len) LOGW("Couldn't write all data to %s. Wrote only %d error: %d", what, static_cast<int>(n), errno);
 }
 
@@ -196,10 +201,10 @@ void writeDataToSerial(const char *data, int len) {
     int src = current_source();
     switch (src) {
         case SRC_UART:
-            write_serial(g_port.uart_fd, data, len, "UART", &g_serial_stalled[0]);
+            write_serial(g_port.uart_fd, data, len, "UART", g_serial_out[0]);
             break;
         case SRC_USB:
-            write_serial(g_port.usb_fd, data, len, "USB", &g_serial_stalled[1]);
+            write_serial(g_port.usb_fd, data, len, "USB", g_serial_out[1]);
             break;
         case SRC_TCP:
             writeDataToSocket(data, len);
