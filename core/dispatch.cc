@@ -42,15 +42,15 @@ void dispatch_command(char *buf, int len, int source_type) {
         LOGE("error readline");
         return;
     }
-    pthread_mutex_lock(&g_port.mutex);
-    g_port.source_type = source_type;
+    g_port.mutex.lock();
+    set_current_source(source_type);
     LOGI("recv line:%s, type:%d", line, source_type);
     if (process_cmd_line(line) == 0) {
         char frame[158] = {0};
         snprintf(frame, 157, "%s\r\n\"AT not support\"\r\nERROR\r\n", line);
         writeDataToSerial(frame, static_cast<int>(strlen(frame)));
     }
-    pthread_mutex_unlock(&g_port.mutex);
+    g_port.mutex.unlock();
 }
 
 int search_command_table(const CommandEntry *table, std::size_t rows, char *line) {
@@ -66,7 +66,7 @@ int search_command_table(const CommandEntry *table, std::size_t rows, char *line
         if (strncmp(name, row.name, sizeof row.name) != 0) continue;
         char resp[kRespSize] = {0};
         char copy[kLineSize] = {0};
-        strncpy(copy, line, kLineSize - 1);
+        memcpy(copy, line, strnlen(line, kLineSize - 1));  // at most 2048 characters
         int rc = row.handler(copy, static_cast<int>(row.arg), resp);
         if (rc == RC_DECLINE) return 0;
         writeDataToserialByResponseType(line, resp, rc);

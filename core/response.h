@@ -5,6 +5,9 @@ void writeDataToserialByResponseType(const char *echo, const char *body, int res
 // Raw bytes to the current source; logged to the command log except for the local socket.
 void writeDataToSerial(const char *data, int len);
 void writeDataToSocket(const char *data, int len);
+// True once for a TCP station that took no answers and was disconnected: its reader
+// then serves nothing more of what the station had already sent.
+bool tcp_station_dropped(int fd);
 void saveCommand2File(const char *text);
 // One blocking read from the current source; 0 for a source that cannot be read.
 int readDataFromSerial(char *buf, int len);

@@ -6,9 +6,12 @@
 #include <termios.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstring>
+#include <thread>
 
 #include "core/dispatch.h"
+#include "core/line_gather.h"
 #include "core/port_state.h"
 #include "core/transports.h"
 #include "platform/device.h"
@@ -18,6 +21,13 @@ namespace {
 
 constexpr const char *kUartPath = "/dev/ttyMSM0";
 constexpr const char *kUsbPath = "/dev/ttyGS0";
+
+// A port that reads end of file again right after every reopen (a gadget without a host,
+// a broken cable) was reopened as fast as the CPU allowed, each time running the hang-up
+// line and growing the command log. Reopens of one port are kept this far apart.
+constexpr auto kReopenGap = std::chrono::seconds(1);
+
+using Clock = std::chrono::steady_clock;
 
 void start_thread(void *(*fn)(void *)) {
     pthread_t tid;
@@ -34,11 +44,18 @@ bool wait_readable(int fd) {
     return true;
 }
 
+// A bounded write may have the descriptor non-blocking for a moment: a read that finds
+// nothing then is not a port error.
+bool nothing_to_read(ssize_t n) { return n < 0 && (errno == EAGAIN || errno == EINTR); }
+
 // After a read error or end of file: close, one reopen, and on success the NULL line.
 // False when the port cannot be reopened: the transport's thread then ends.
-bool reopen(int *slot, const char *path) {
+bool reopen(int *slot, const char *path, Clock::time_point *last) {
     LOGE("Error in serail read:%d", errno);
     close(*slot);
+    auto now = Clock::now();
+    if (now - *last < kReopenGap) std::this_thread::sleep_for(kReopenGap - (now - *last));
+    *last = Clock::now();
     *slot = open_serial_device(path);
     if (*slot < 0) {
         LOGE("The process is terminated due to fatal error");
@@ -97,38 +114,56 @@ void *uart_thread(void *) { return serial_thread(&g_port.uart_fd, kUartPath, uar
 void *vcom_thread(void *) { return serial_thread(&g_port.usb_fd, kUsbPath, vcom_monitor); }
 
 void uart_monitor() {
+    char *buf = g_port.uart_buf;
+    Clock::time_point last_reopen{};
     for (;;) {
         if (!wait_readable(g_port.uart_fd)) continue;
-        memset(g_port.recv_buf, 0, sizeof g_port.recv_buf);
-        ssize_t n = read(g_port.uart_fd, g_port.recv_buf, kLineSize - 1);
+        memset(buf, 0, kLineSize);
+        ssize_t n = read(g_port.uart_fd, buf, kLineSize - 1);
+        if (nothing_to_read(n)) continue;
         if (n == 1) continue;  // a lone line end
         if (n <= 0) {
-            if (!reopen(&g_port.uart_fd, kUartPath)) return;
+            if (!reopen(&g_port.uart_fd, kUartPath, &last_reopen)) return;
             continue;
         }
-        dispatch_command(g_port.recv_buf, static_cast<int>(n), SRC_UART);
+        dispatch_command(buf, static_cast<int>(n), SRC_UART);
     }
+}
+
+Gathered usb_gather(const char *buf, int *offset, ssize_t n, int *total) {
+    *total = *offset + static_cast<int>(n);
+    if (n >= 1 && buf[*total - 1] != '\r' && buf[*total - 1] != '\n') {
+        *offset = *total;
+        return Gathered::Partial;
+    }
+    *offset = 0;
+    if (*total == 1) return Gathered::LoneLineEnd;
+    if (*total > 1) return Gathered::Line;
+    return Gathered::PortDead;
 }
 
 // The gadget port may deliver a line in pieces: gather until a line end arrives, and
 // never throw gathered input away (a full buffer or a failed read dispatches it).
 void vcom_monitor() {
+    char *buf = g_port.usb_buf;
+    Clock::time_point last_reopen{};
     int offset = 0;
     for (;;) {
         if (!wait_readable(g_port.usb_fd)) continue;
-        if (offset == 0) memset(g_port.recv_buf, 0, sizeof g_port.recv_buf);
-        ssize_t n = read(g_port.usb_fd, g_port.recv_buf + offset, static_cast<size_t>(kLineSize - 1 - offset));
-        int total = offset + static_cast<int>(n);
-        if (n >= 1 && g_port.recv_buf[total - 1] != '\r' && g_port.recv_buf[total - 1] != '\n') {
-            offset = total;
-            continue;
+        if (offset == 0) memset(buf, 0, kLineSize);
+        ssize_t n = read(g_port.usb_fd, buf + offset, static_cast<size_t>(usb_read_room(offset)));
+        if (nothing_to_read(n)) continue;
+        int total = 0;
+        switch (usb_gather(buf, &offset, n, &total)) {
+            case Gathered::Partial:
+            case Gathered::LoneLineEnd:
+                break;
+            case Gathered::Line:
+                dispatch_command(buf, total, SRC_USB);
+                break;
+            case Gathered::PortDead:
+                if (!reopen(&g_port.usb_fd, kUsbPath, &last_reopen)) return;
+                break;
         }
-        offset = 0;
-        if (total == 1) continue;
-        if (total > 1) {
-            dispatch_command(g_port.recv_buf, total, SRC_USB);
-            continue;
-        }
-        if (!reopen(&g_port.usb_fd, kUsbPath)) return;
     }
 }

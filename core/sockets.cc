@@ -14,6 +14,7 @@
 
 #include "core/dispatch.h"
 #include "core/port_state.h"
+#include "core/response.h"
 #include "core/transports.h"
 #include "platform/android.h"
 #include "platform/device.h"
@@ -21,6 +22,10 @@
 #include "platform/log.h"
 
 namespace {
+
+// A local client that connects and sends nothing held the local socket for everyone;
+// one that has sent nothing after this long is dropped (as a failed receive).
+constexpr int kLocalIdleSeconds = 2;
 
 void start_detached(void *(*fn)(void *)) {
     pthread_t tid;
@@ -33,6 +38,7 @@ void set_flag(int fd, int level, int opt, const char *what) {
 }
 
 void close_tcp_client() {
+    tcp_station_dropped(g_port.tcp_client_fd);  // a drop pending for it is done with
     close(g_port.tcp_client_fd);
     g_port.tcp_client_fd = -1;  // a stale number must never reach a reused descriptor
 }
@@ -71,11 +77,12 @@ void *create_service_socket(void *) {
 }
 
 void socket_monitor() {
+    char *buf = g_port.tcp_buf;
     accept_service_socket();
     for (;;) {
-        memset(g_port.recv_buf, 0, sizeof g_port.recv_buf);
-        int n = read_service_socket(g_port.recv_buf, kLineSize - 1);
-        dispatch_command(g_port.recv_buf, n, SRC_TCP);  // 0: the station has gone
+        memset(buf, 0, kLineSize);
+        int n = read_service_socket(buf, kLineSize - 1);
+        dispatch_command(buf, n, SRC_TCP);  // 0: the station has gone
         if (n <= 0) accept_service_socket();
     }
 }
@@ -107,6 +114,11 @@ int read_service_socket(char *buf, int len) {
         // Only after 100 failed accepts in a row: the port is unusable.
         LOGE("invalid station descriptor %d", fd);
         abort();
+    }
+    if (tcp_station_dropped(fd)) {
+        LOGE("ERROR in socket:%d", ESHUTDOWN);
+        close_tcp_client();
+        return 0;
     }
     struct pollfd pfd = {fd, POLLIN, 0};
     int ret = poll(&pfd, 1, -1);
@@ -154,6 +166,8 @@ void *socket_local_thread(void *) {
             continue;
         }
         LOGI("accept %d", client);
+        struct timeval idle = {kLocalIdleSeconds, 0};
+        setsockopt(client, SOL_SOCKET, SO_RCVTIMEO, &idle, sizeof idle);
         char buf[128] = {0};
         ssize_t n = recv(client, buf, 126, 0);
         buf[127] = '\0';
@@ -162,11 +176,11 @@ void *socket_local_thread(void *) {
             close(client);
         } else {
             LOGI("recv_buf %s", buf);
-            if (g_port.local_client_fd >= 0) {
-                LOGI("close old fd_local_client %d", g_port.local_client_fd);
-                close(g_port.local_client_fd);
+            int old = swap_local_client(client);
+            if (old >= 0) {
+                LOGI("close old fd_local_client %d", old);
+                close(old);
             }
-            g_port.local_client_fd = client;
             dispatch_command(buf, static_cast<int>(strlen(buf)), SRC_LOCAL);
         }
         budget = 100;

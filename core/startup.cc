@@ -91,18 +91,54 @@ int assembly_at_mode_test() {
     return 1;
 }
 
+namespace {
+
+// Appends the decimal digits of v; async-signal-safe (no stdio, no locale).
+char *put_int(char *at, int v) {
+    char digits[12];
+    int n = 0;
+    unsigned u = v < 0 ? 0u - static_cast<unsigned>(v) : static_cast<unsigned>(v);
+    do {
+        digits[n++] = static_cast<char>('0' + u % 10);
+        u /= 10;
+    } while (u != 0);
+    if (v < 0) *at++ = '-';
+    while (n > 0) *at++ = digits[--n];
+    return at;
+}
+
+char *put_text(char *at, const char *text) {
+    while (*text != '\0') *at++ = *text++;
+    return at;
+}
+
+// Closes a descriptor slot once: whoever empties the slot closes what was in it.
+void close_slot(int *slot, bool only_if_open) {
+    int fd = __atomic_exchange_n(slot, -1, __ATOMIC_ACQ_REL);
+    if (fd >= 0 || !only_if_open) close(fd);
+}
+
+}  // namespace
+
+// Runs on whichever thread got the signal, possibly in the middle of the Android log,
+// stdio or malloc holding a lock: so only async-signal-safe calls here. The "signal:%d"
+// line is formatted by hand and written straight to stderr, where the daemon's log goes
+// on the simulated phone and where init's service logging picks it up on a phone.
 void ftcmd_signal_handler(int sig) {
-    LOGE("signal:%d", sig);
-    for (int *fd : {&g_port.local_client_fd, &g_port.local_listen_fd, &g_port.uart_fd, &g_port.usb_fd}) {
-        if (*fd >= 0) {
-            close(*fd);
-            *fd = -1;
-        }
-    }
-    close(g_port.tcp_listen_fd);
-    g_port.tcp_listen_fd = -1;
-    close(g_port.tcp_client_fd);
-    g_port.tcp_client_fd = -1;
+    char line[128];
+    char *at = put_text(line, FTCMD_LOG_TAG ": ");
+    at = put_int(at, __LINE__);
+    at = put_text(at, ":ftcmd_signal_handler(): signal:");
+    at = put_int(at, sig);
+    *at++ = '\n';
+    ssize_t ignored = write(STDERR_FILENO, line, static_cast<size_t>(at - line));
+    (void)ignored;
+    close_slot(&g_port.local_client_fd, true);
+    close_slot(&g_port.local_listen_fd, true);
+    close_slot(&g_port.uart_fd, true);
+    close_slot(&g_port.usb_fd, true);
+    close_slot(&g_port.tcp_listen_fd, false);
+    close_slot(&g_port.tcp_client_fd, false);
     _exit(sig);
 }
 

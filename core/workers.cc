@@ -4,6 +4,10 @@
 #include <unistd.h>
 
 #include "core/port_state.h"
+#include <atomic>
+#include <chrono>
+#include <thread>
+
 #include "platform/android.h"
 #include "platform/device.h"
 #include "platform/factory.h"
@@ -12,14 +16,50 @@
 int g_vibrator_run = 0;
 int g_lights_run = 0;
 
+namespace {
+
+std::atomic<int> g_live_workers{0};
+
+struct WorkerStart {
+    void *(*fn)(void *);
+    void *arg;
+};
+
+// Counts the worker out once its function has returned, after its last device access.
+void *run_worker(void *p) {
+    WorkerStart start = *static_cast<WorkerStart *>(p);
+    delete static_cast<WorkerStart *>(p);
+    void *result = start.fn(start.arg);
+    --g_live_workers;
+    return result;
+}
+
+}  // namespace
+
 int start_worker(void *(*fn)(void *), void *arg) {
     pthread_t tid;
-    return pthread_create(&tid, nullptr, fn, arg);
+    ++g_live_workers;
+    auto *start = new WorkerStart{fn, arg};
+    int rc = pthread_create(&tid, nullptr, run_worker, start);
+    if (rc != 0) {
+        delete start;
+        --g_live_workers;
+    }
+    return rc;
+}
+
+bool wait_workers_done(int timeout_ms) {
+    auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeout_ms);
+    while (g_live_workers.load() > 0) {
+        if (std::chrono::steady_clock::now() >= deadline) return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    return true;
 }
 
 void wait_for_current_answer() {
-    pthread_mutex_lock(&g_port.mutex);
-    pthread_mutex_unlock(&g_port.mutex);
+    g_port.mutex.lock();
+    g_port.mutex.unlock();
 }
 
 void *reboot_thread(void *reason) {

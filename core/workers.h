@@ -4,6 +4,9 @@
 // Starts fn(arg) on a new thread with default attributes; the worker detaches itself.
 // Returns pthread_create's result (0 on success).
 int start_worker(void *(*fn)(void *), void *arg);
+// Waits until every worker started with start_worker has returned; false if some are
+// still running after timeout_ms (a test waits for them before its sandbox goes).
+bool wait_workers_done(int timeout_ms);
 
 // A worker that writes frames to the station calls this before its first one: the
 // dispatcher holds its mutex until the answer of the line that started the worker has

@@ -4,6 +4,7 @@
 #include <strings.h>
 #include <unistd.h>
 
+#include <climits>
 #include <cstdarg>
 #include <cstdio>
 #include <cstring>
@@ -72,4 +73,29 @@ std::vector<std::string_view> comma_fields(std::string_view line) {
         i = comma + 1;
     }
     return fields;
+}
+
+bool leading_number(const char *text, long long min, long long max, long long *out) {
+    if (text == nullptr) return false;
+    const char *p = text;
+    bool negative = *p == '-';
+    if (*p == '-' || *p == '+') ++p;
+    if (*p < '0' || *p > '9') return false;
+    unsigned long long v = 0;
+    bool huge = false;  // beyond every long long: outside any range
+    for (; *p >= '0' && *p <= '9'; ++p) {
+        if (v > (ULLONG_MAX - 9) / 10) huge = true;
+        else v = v * 10 + static_cast<unsigned>(*p - '0');
+    }
+    if (huge || v > static_cast<unsigned long long>(LLONG_MAX)) return false;
+    long long value = negative ? -static_cast<long long>(v) : static_cast<long long>(v);
+    if (value < min || value > max) return false;
+    *out = value;
+    return true;
+}
+
+bool file_item_ok(const char *text, bool is_key) {
+    if (text == nullptr) return false;
+    if (is_key && (text[0] == '\0' || strchr(text, '=') != nullptr)) return false;
+    return strpbrk(text, "\r\n") == nullptr;
 }

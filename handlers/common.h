@@ -38,3 +38,14 @@ bool read_node(const char *path, char *buf, size_t size);
 // The non-empty comma-separated fields of a line, as a tokeniser sees them: "1,,0" has
 // two fields, and the first field is the command with its "=" part.
 std::vector<std::string_view> comma_fields(std::string_view line);
+
+// The decimal number at the start of text, read as atoi reads it but without its
+// undefined overflow: false when text does not start with a digit (after an optional
+// sign) or the value lies outside [min, max]. What follows the digits is ignored, as
+// atoi ignores it (a TCP station's own line ending stays in the last field).
+bool leading_number(const char *text, long long min, long long max, long long *out);
+
+// True when station text may be stored as one item of a key=value or line-based file:
+// no line ends (which would add lines, and with them keys), and for a key also not empty
+// and no "=" (which would move the split between key and value).
+bool file_item_ok(const char *text, bool is_key);

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <climits>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -93,21 +94,41 @@ int show_system_time(char *resp) {
     return RC_OK;
 }
 
+// The clock fields as a station gives them, with the range each may take. The ranges
+// keep the values inside what mktime can hold (a year of 2147483648 overflowed the int,
+// 2147483647 set an absurd clock); mktime still normalises within them (31 February is
+// 3 March), as it always has.
+struct ClockField {
+    const char *name;
+    long long min, max;
+};
+constexpr ClockField kClockFields[6] = {
+    {"year", 1970, 2099}, {"month", 1, 12}, {"day", 1, 31}, {"hour", 0, 23}, {"minute", 0, 59}, {"second", 0, 60},
+};
+
 int set_system_time(const char *cmd) {
     std::vector<std::string> p = pieces(cmd, ", -:\"");
     if (p.size() < 7) {
         LOGE("time incomplete: %s", cmd);
         return RC_ERROR;
     }
+    std::array<long long, 6> v{};
+    for (size_t i = 0; i < v.size(); ++i) {
+        const ClockField &f = kClockFields[i];
+        if (!leading_number(p[i + 1].c_str(), f.min, f.max, &v[i])) {
+            LOGE("%s out of range (%lld-%lld): %s", f.name, f.min, f.max, p[i + 1].c_str());
+            return RC_ERROR;
+        }
+    }
     time_t now = dev::now();
     struct tm tm {};
     localtime_r(&now, &tm);
-    tm.tm_year = atoi(p[1].c_str()) - 1900;
-    tm.tm_mon = atoi(p[2].c_str()) - 1;
-    tm.tm_mday = atoi(p[3].c_str());
-    tm.tm_hour = atoi(p[4].c_str());
-    tm.tm_min = atoi(p[5].c_str());
-    tm.tm_sec = atoi(p[6].c_str());
+    tm.tm_year = static_cast<int>(v[0] - 1900);
+    tm.tm_mon = static_cast<int>(v[1] - 1);
+    tm.tm_mday = static_cast<int>(v[2]);
+    tm.tm_hour = static_cast<int>(v[3]);
+    tm.tm_min = static_cast<int>(v[4]);
+    tm.tm_sec = static_cast<int>(v[5]);
     struct timeval tv {};
     tv.tv_sec = mktime(&tm);
     if (dev::set_clock(&tv) != 0) {
@@ -245,7 +266,11 @@ int get_factoryreset_time_handler(char *cmd, int arg, char *resp) {
         LOGE("boot not completed: %s", boot.data());
         return RC_ERROR;
     }
-    long long since = static_cast<long long>(dev::now()) - strtoll(boot_time.data(), nullptr, 10);
+    // The property can hold any text (AT+QXPROP sets properties): a difference that does
+    // not fit is taken as the largest one of its sign.
+    long long since = 0;
+    if (__builtin_sub_overflow(static_cast<long long>(dev::now()), strtoll(boot_time.data(), nullptr, 10), &since))
+        since = boot_time.data()[0] == '-' ? LLONG_MAX : LLONG_MIN;
     LOGI("%lld seconds since boot completed", since);
     if (since > 180) {
         quote_reason(resp, "Pass");
@@ -475,9 +500,12 @@ int cache_last_test_info_handler(char *cmd, int arg, char *resp) {
         return RC_ATERROR;
     }
     const char *key = f[1].c_str();
+    // A key or value with a line end (or a key with "=") would add items of the
+    // station's choosing to the file: such an item cannot exist, be set or be deleted.
+    const bool key_ok = file_item_ok(key, true);
 
     if (line_starts(cmd, "AT+QX_CACHE_PROP=0", 18)) {
-        const char *value = get_property_file_item_value(kTestInfoFile, key);
+        const char *value = key_ok ? get_property_file_item_value(kTestInfoFile, key) : nullptr;
         if (value == nullptr) {
             quote_body(resp, "get value failed!");
             return RC_ATNG;
@@ -491,7 +519,7 @@ int cache_last_test_info_handler(char *cmd, int arg, char *resp) {
             return RC_ATERROR;
         }
         const char *value = f[2].c_str();
-        if (set_property_file_item_value(kTestInfoFile, key, value) < 0) {
+        if (!key_ok || !file_item_ok(value, false) || set_property_file_item_value(kTestInfoFile, key, value) < 0) {
             LOGE("set %s=%s failed", key, value);
             quote_body(resp, "set value failed");
             return RC_ATNG;
@@ -505,7 +533,7 @@ int cache_last_test_info_handler(char *cmd, int arg, char *resp) {
         return RC_ATOK;
     }
     if (line_starts(cmd, "AT+QX_CACHE_PROP=2", 18)) {
-        if (delete_property_file_item(kTestInfoFile, key) != 0) {
+        if (!key_ok || delete_property_file_item(kTestInfoFile, key) != 0) {
             body_printf(resp, "\r\n\"delete %s error\"\r\n", key);
             return RC_ATNG;
         }

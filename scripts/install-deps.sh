@@ -3,7 +3,8 @@
 set -euo pipefail
 pkgs=(cmake make g++ pkg-config googletest libgtest-dev libgmock-dev
       android-liblog-dev android-libcutils-dev libssl-dev
-      socat ppp picocom netcat-openbsd)
+      socat ppp picocom netcat-openbsd
+      clang-14 libclang-rt-14-dev libbenchmark-dev)
 missing=()
 for p in "${pkgs[@]}"; do
   dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q 'install ok installed' || missing+=("$p")

@@ -59,6 +59,10 @@ INSTANTIATE_TEST_SUITE_P(
                       RotationCase{511999, 10, true, false, true, false},
                       RotationCase{512000, kNone, false, false, false, false},  // switch to a fresh file 1
                       RotationCase{512000, 511950, false, false, false, true},
-                      RotationCase{512000, 512000, true, true, false, false}));  // both full: 0 anew
+                      RotationCase{512000, 512000, true, true, false, false}),  // both full: 0 anew
+    [](const ::testing::TestParamInfo<RotationCase> &i) {
+        auto size = [](size_t s) { return s == kNone ? std::string("None") : std::to_string(s); };
+        return "Log0_" + size(i.param.size0) + "_Log1_" + size(i.param.size1);
+    });
 
 }  // namespace

@@ -18,34 +18,6 @@ namespace {
 
 const std::string kNotSupported = "\"AT not support\"\r\nERROR\r\n";
 
-// A pseudo-terminal whose slave the daemon opens as one of its serial ports.
-struct Pty {
-    int master = -1;
-    std::string slave;
-    Pty(const Sandbox &box, const char *device) {
-        master = posix_openpt(O_RDWR | O_NOCTTY);
-        grantpt(master);
-        unlockpt(master);
-        slave = ptsname(master);
-        std::filesystem::create_symlink(slave, box.path(device));
-        // Held open so that the master does not see a hang-up while the daemon reopens.
-        keep = open(slave.c_str(), O_RDWR | O_NOCTTY);
-    }
-    ~Pty() {
-        close(keep);
-        close(master);
-    }
-    int keep = -1;
-    void send(const std::string &s) const { ASSERT_EQ(write(master, s.data(), s.size()), (ssize_t)s.size()); }
-    speed_t speed() const {
-        int fd = open(slave.c_str(), O_RDWR | O_NOCTTY);
-        struct termios t {};
-        tcgetattr(fd, &t);
-        close(fd);
-        return cfgetospeed(&t);
-    }
-};
-
 void sleep_ms(int ms) { std::this_thread::sleep_for(std::chrono::milliseconds(ms)); }
 
 std::string exchange(int fd, const std::string &data, size_t want) {
@@ -117,24 +89,24 @@ TEST(Daemon, UsbSerialAssemblesLinesAndReopensAfterHangUp) {
     Daemon d(box);
     ASSERT_TRUE(d.wait_log("Opened serial port:/dev/ttyGS0"));
     sleep_ms(200);
-    usb.send("AT+QX");
+    ASSERT_TRUE(usb.send("AT+QX"));
     sleep_ms(50);
-    usb.send("NOPE=");
+    ASSERT_TRUE(usb.send("NOPE="));
     sleep_ms(50);
-    usb.send("1\r");
+    ASSERT_TRUE(usb.send("1\r"));
     std::string a = "AT+QXNOPE=1\r\n" + kNotSupported;
     EXPECT_EQ(read_some(usb.master, a.size() + 1, 2000), a);
     EXPECT_EQ(usb.speed(), B38400);  // no UART mode: the line speed is left alone
-    usb.send("\r");  // a lone line end is ignored
+    ASSERT_TRUE(usb.send("\r"));  // a lone line end is ignored
     EXPECT_EQ(read_some(usb.master, 1, 300), "");
 
     box.set_prop("sys.qrcode.view", "0");
-    usb.send("\x04");  // end of file at the start of a line: the port reads 0
+    ASSERT_TRUE(usb.send("\x04"));  // end of file at the start of a line: the port reads 0
     std::string hangup = "AT+QXMT=1,0\r\n\r\nATOK\r\n";  // nothing was open
     EXPECT_EQ(read_some(usb.master, hangup.size(), 3000), hangup) << d.log();  // the last source was USB
     EXPECT_TRUE(d.wait_log("The FD is reopen successfully"));
     EXPECT_EQ(box.prop("sys.qrcode.view"), "1");
-    usb.send("AT+QXNOPE=1\r");
+    ASSERT_TRUE(usb.send("AT+QXNOPE=1\r"));
     EXPECT_EQ(read_some(usb.master, a.size()), a);
 }
 
@@ -147,12 +119,13 @@ TEST(Daemon, UartServesInConsoleModeAt115200) {
     sleep_ms(200);
     EXPECT_EQ(uart.speed(), B115200);
     EXPECT_EQ(usb.speed(), B115200);
-    uart.send("#12\x01" "AT+QXNOPE=3\r");  // noise before the command is skipped
+    ASSERT_TRUE(uart.send("#12\x01" "AT+QXNOPE=3\r"));  // noise before the command is skipped
     std::string a = "AT+QXNOPE=3\r\n" + kNotSupported;
     EXPECT_EQ(read_some(uart.master, a.size()), a);
 }
 
 struct BootCase {
+    const char *name;
     const char *cmdline;
     int uart, sp;
     const char *factory_log, *assembly;
@@ -167,17 +140,26 @@ TEST_P(BootModeTest, KernelCommandLineSelectsTheMode) {
     Daemon d(box, c.cmdline);
     EXPECT_TRUE(d.wait_log("is_uart_flag=" + std::to_string(c.uart) + ", is_sp=" + std::to_string(c.sp)));
     EXPECT_TRUE(d.wait_prop("sys.factory.assembly_at_mode", c.assembly)) << box.prop("sys.factory.assembly_at_mode");
+    // Start-up sets the log property last, after the transports are up.
+    if (*c.factory_log != '\0') {
+        EXPECT_TRUE(d.wait_prop("sys.factory.log", c.factory_log));
+    }
     EXPECT_EQ(box.prop("sys.factory.log"), c.factory_log);
-    EXPECT_EQ(d.log().find("Opened serial port:/dev/ttyMSM0") != std::string::npos, c.uart == 1);
+    if (c.uart == 1) {
+        EXPECT_TRUE(d.wait_log("Opened serial port:/dev/ttyMSM0"));
+    } else {
+        EXPECT_EQ(d.log().find("Opened serial port:/dev/ttyMSM0"), std::string::npos);
+    }
     EXPECT_EQ(box.events().find("audio init_ftm") != std::string::npos, c.audio_init);
 }
 
 INSTANTIATE_TEST_SUITE_P(
     Modes, BootModeTest,
-    ::testing::Values(BootCase{"console=ttyMSM0", 0, 0, "", "", true},
-                      BootCase{"console-at=sendAT quiet", 1, 1, "1", "", false},
-                      BootCase{"console-at=sendNormal", 1, 0, "1", "", true},
-                      BootCase{"console-at=sendAT_assembly", 0, 1, "1", "2", false}));
+    ::testing::Values(BootCase{"Plain", "console=ttyMSM0", 0, 0, "", "", true},
+                      BootCase{"SendAt", "console-at=sendAT quiet", 1, 1, "1", "", false},
+                      BootCase{"SendNormal", "console-at=sendNormal", 1, 0, "1", "", true},
+                      BootCase{"SendAtAssembly", "console-at=sendAT_assembly", 0, 1, "1", "2", false}),
+    [](const ::testing::TestParamInfo<BootCase> &i) { return std::string(i.param.name); });
 
 TEST(Daemon, AssemblyModeIsEnteredOncePerBoot) {
     Sandbox box;

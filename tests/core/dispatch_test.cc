@@ -2,6 +2,7 @@
 #include <cstring>
 
 #include "tests/support/in_process.h"
+#include "tests/support/test_name.h"
 
 namespace {
 
@@ -32,7 +33,8 @@ INSTANTIATE_TEST_SUITE_P(
                       TrimCase{"AT+X=1\t\r\n", -1, "AT+X=1\t"},       // tabs stay
                       TrimCase{"12345\r\n", -1, ""},                  // no "a" at all
                       TrimCase{"AT+QXCN=1\r\n", 12, "AT+QXCN=1\r\n"},  // TCP: starts at the NUL
-                      TrimCase{"zzz", 4, ""}));
+                      TrimCase{"zzz", 4, ""}),
+    named_by([](const TrimCase &c) { return c.in; }));
 
 struct CutCase {
     const char *in;
@@ -52,7 +54,8 @@ INSTANTIATE_TEST_SUITE_P(Lines, CutTest,
                          ::testing::Values(CutCase{"AT+QXCN=1AT+QXCN=1", "AT+QXCN=1"},
                                            CutCase{"AT+QXCN=1\r\nAT+QXCN=1\r\n", "AT+QXCN=1\r\n"},
                                            CutCase{"AT+QXCN=1AT+QXWLAN=1", "AT+QXCN=1AT+QXWLAN=1"},
-                                           CutCase{"AT+", "AT+"}, CutCase{"AT+QXCN=1", "AT+QXCN=1"}));
+                                           CutCase{"AT+", "AT+"}, CutCase{"AT+QXCN=1", "AT+QXCN=1"}),
+                         named_by([](const CutCase &c) { return c.in; }));
 
 // A private table to watch the search: which rows run, with what, and what follows.
 int g_calls = 0;
@@ -113,7 +116,8 @@ INSTANTIATE_TEST_SUITE_P(
                       SearchCase{"at+one=1", 0, 0, 0, "", false},  // names compare with case
                       SearchCase{"=AT+ONE", 0, 0, 0, "", false},
                       SearchCase{"AT+ABCDEFGHIJKLMNOPQRSTUVWXYZ0123456=1", 7, 1, 1,
-                                 "AT+ABCDEFGHIJKLMNOPQRSTUVWXYZ0123456=1\r\nbody\r\nATOK\r\n", false}));
+                                 "AT+ABCDEFGHIJKLMNOPQRSTUVWXYZ0123456=1\r\nbody\r\nATOK\r\n", false}),
+    named_by([](const SearchCase &c) { return c.line; }));
 
 TEST(Tables, RowsAreWellFormed) {
     const std::pair<const CommandEntry *, std::size_t> tables[] = {
@@ -148,7 +152,7 @@ class DispatchTest : public InProcess, public ::testing::WithParamInterface<Disp
 TEST_P(DispatchTest, AnswersOnTheSource) {
     const DispatchCase &c = GetParam();
     EXPECT_EQ(serve(c.received, c.source), c.frame);
-    EXPECT_EQ(g_port.source_type, c.source);
+    EXPECT_EQ(current_source(), c.source);
 }
 
 INSTANTIATE_TEST_SUITE_P(
@@ -162,7 +166,8 @@ INSTANTIATE_TEST_SUITE_P(
         DispatchCase{"ATD112;\r\n", SRC_USB, "ATD112;\r\nOK\r\n"},
         DispatchCase{"ATD112;=1\n", SRC_USB, "ATD112;=1\r\nOK\r\n"},
         DispatchCase{"ATD112;\r\n", SRC_TCP, "ATD112;\r\n\r\nOK\r\n"},
-        DispatchCase{" \r\n", SRC_USB, ""}));
+        DispatchCase{" \r\n", SRC_USB, ""}),
+    named_by([](const DispatchCase &c) { return c.received; }));
 
 TEST_F(InProcess, EmergencyCallRefusedAnswersError) {
     box.fault("testapp-silent");
@@ -182,7 +187,7 @@ TEST_F(InProcess, NullLineRunsTheHangUpCommandOnTheLastSource) {
     box.set_prop("sys.qrcode.view", "0");
     dispatch_command(nullptr, 0, SRC_TCP);
     EXPECT_EQ(box.prop("sys.qrcode.view"), "1");
-    EXPECT_EQ(g_port.source_type, SRC_USB);
+    EXPECT_EQ(current_source(), SRC_USB);
     EXPECT_EQ(answer(), "AT+QXMT=1,0\r\n\r\nATOK\r\n");  // nothing was open
 }
 

@@ -1,7 +1,10 @@
 // The answer frame for every ResultCode, and where frames are routed.
 #include <fcntl.h>
 
+#include <cstdlib>
+
 #include "tests/support/in_process.h"
+#include "tests/support/test_name.h"
 
 namespace {
 
@@ -37,7 +40,11 @@ INSTANTIATE_TEST_SUITE_P(
                       FrameCase{9, "", "AT+QXCN=0\r\n\r\nATERROR\r\n"},
                       FrameCase{101, "", "AT+QXCN=0\r\n\r\nNot Implement\r\n"},
                       FrameCase{42, "", "AT+QXCN=0\r\n\r\nUNKNOWN\r\n"},
-                      FrameCase{-1, "", "AT+QXCN=0\r\n\r\nUNKNOWN\r\n"}));
+                      FrameCase{-1, "", "AT+QXCN=0\r\n\r\nUNKNOWN\r\n"}),
+    [](const ::testing::TestParamInfo<FrameCase> &i) {
+        return "Code" + std::string(i.param.result < 0 ? "Minus" : "") + std::to_string(std::abs(i.param.result)) +
+               "_" + std::to_string(i.index);
+    });
 
 TEST_F(InProcess, LongFrameIsCutAt2047Bytes) {
     std::string body(3000, 'b');
@@ -58,7 +65,7 @@ TEST_F(InProcess, LocalSocketGetsOneAnswerPerConnection) {
 }
 
 TEST_F(InProcess, UnknownSourceSendsNothingButLogs) {
-    g_port.source_type = 0;
+    force_current_source(0);
     writeDataToSerial("AT+X=1\r\n\r\nOK\r\n", 14);
     EXPECT_EQ(answer(), "");
     EXPECT_NE(box.read("/cache/recovery/last_atcmd0").find("AT+X=1\r\n\r\nOK\r\n\r\n"), std::string::npos);
@@ -77,7 +84,7 @@ TEST_F(InProcess, ReadDataFromSerialReadsTheCurrentSource) {
     char buf[16] = {0};
     EXPECT_EQ(readDataFromSerial(buf, sizeof buf), 3);
     EXPECT_STREQ(buf, "abc");
-    g_port.source_type = SRC_LOCAL;
+    force_current_source(SRC_LOCAL);
     EXPECT_EQ(readDataFromSerial(buf, sizeof buf), 0);
 }
 

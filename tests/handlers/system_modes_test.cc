@@ -4,6 +4,7 @@
 
 #include "core/nv.h"
 #include "tests/support/in_process.h"
+#include "tests/support/test_name.h"
 
 namespace {
 
@@ -49,6 +50,8 @@ TEST_P(SystemModesTest, AnswersAndEffects) {
 const std::string kSimState = "message sim_state -> SIM1,SIM2\n";
 const std::string kLongSims(60, 'S');
 
+const auto by_line = named_by([](const Case &c) { return c.line; });
+
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(FlightAndSleep, SystemModesTest, ::testing::Values(
     Case{.line = "AT+OFFL=1", .sp = 1, .trailer = "OK", .events = "setprop sys.stop.all=1\n"},
@@ -62,7 +65,7 @@ INSTANTIATE_TEST_SUITE_P(FlightAndSleep, SystemModesTest, ::testing::Values(
          .events = "message go_to_sleep -> (silent)\n"},
     Case{.line = "AT+EQSB=0", .sp = 1, .early = kEarly, .trailer = "OK", .events = "sync \nfb blank 0\n"},
     Case{.line = "AT+EQSB=0", .sp = 1, .remove = "/sys/power/autosleep", .early = kEarly, .body = "\"error:-2\"",
-         .trailer = "ERROR", .events = "sync \nfb blank 0\n"}));
+         .trailer = "ERROR", .events = "sync \nfb blank 0\n"}), by_line);
 
 INSTANTIATE_TEST_SUITE_P(AtMode, SystemModesTest, ::testing::Values(
     Case{.line = "AT+ESLP=1", .trailer = "OK", .events = "nv write\n", .nv_at_mode = '0'},
@@ -70,7 +73,7 @@ INSTANTIATE_TEST_SUITE_P(AtMode, SystemModesTest, ::testing::Values(
     Case{.line = "AT+ESLP=1", .fault = "nv-write", .trailer = "ERROR"},
     Case{.line = "AT+ESLP=2", .trailer = "OK"},
     Case{.line = "AT+ESLP=3", .sp = 1, .body = "\r\n\"1\"\r\n", .trailer = "OK"},
-    Case{.line = "AT+ESLP=4", .trailer = "ERROR"}));
+    Case{.line = "AT+ESLP=4", .trailer = "ERROR"}), by_line);
 
 INSTANTIATE_TEST_SUITE_P(Cards, SystemModesTest, ::testing::Values(
     Case{.line = "AT+QXSIM=1", .trailer = "OK", .events = kSimState},
@@ -91,7 +94,7 @@ INSTANTIATE_TEST_SUITE_P(Cards, SystemModesTest, ::testing::Values(
          .trailer = "ATNG", .events = "message sim_card_test 4 -> error1=2\n"},
     Case{.line = "AT+QX_SIM_REP=0", .message = "sim_card_test 5", .reply = "failed=3,x", .trailer = "ERROR",
          .events = "message sim_card_test 5 -> failed=3,x\n"},
-    Case{.line = "AT+QX_SIM_USE=3", .trailer = "ERROR"}));
+    Case{.line = "AT+QX_SIM_USE=3", .trailer = "ERROR"}), by_line);
 // clang-format on
 
 class SystemModesOnceTest : public InProcess {};

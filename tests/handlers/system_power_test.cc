@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "tests/support/in_process.h"
+#include "tests/support/test_name.h"
 
 namespace {
 
@@ -108,6 +109,8 @@ TEST_P(PowerLine, Answers) {
     expect_in_order(log, seq);
 }
 
+const auto by_line = named_by([](const Case &c) { return c.line; });
+
 INSTANTIATE_TEST_SUITE_P(Power, PowerLine, ::testing::Values(
     Case{"AT+QXADB=0,0", nullptr, "", "OK", Nv::Closed, {}, "message shutdown"},
     Case{"AT+QXADB=0,1", nullptr, "", "OK", Nv::Closed, {"message shutdown immediately -> ok"}},
@@ -160,7 +163,10 @@ INSTANTIATE_TEST_SUITE_P(Power, PowerLine, ::testing::Values(
     Case{"AT+QX_LCM_DISP=1," + kLong, nullptr, "", "ATOK", Nv::Same, {"--es pn " + kLong.substr(0, 120) + "\n"}},
     Case{"AT+QX_LCM_DISP=3,x", nullptr, "\"invalid command\"", "ATERROR", Nv::Same},
     Case{"AT+QX_SHD_TIME=1,3a", nullptr, "\"invalid paramter\"", "ATNG", Nv::Same},
-    Case{"AT+QX_SHD_TIME=1,1201", nullptr, "", "ATNG", Nv::Same}));
+    Case{"AT+QX_SHD_TIME=1,1201", nullptr, "", "ATNG", Nv::Same},
+    // Values that wrap a 32-bit or 64-bit count back into the accepted range.
+    Case{"AT+QX_SHD_TIME=1,4294967332", nullptr, "", "ATNG", Nv::Same, {}, "activity"},
+    Case{"AT+QX_SHD_TIME=1,18446744073709551652", nullptr, "", "ATNG", Nv::Same, {}, "service"}), by_line);
 
 TEST_F(PowerTest, Acm4NeverChargesAndAMissingChargeNodeStaysMissing) {
     std::filesystem::remove(box.path(kSoc));

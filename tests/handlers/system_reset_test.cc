@@ -6,6 +6,7 @@
 #include "core/nv.h"
 #include "platform/sim/sim.h"
 #include "tests/support/in_process.h"
+#include "tests/support/test_name.h"
 
 namespace {
 
@@ -63,6 +64,8 @@ TEST_P(SystemResetTest, AnswersAndEffects) {
     is_sp = saved_sp;
 }
 
+const auto by_line = named_by([](const Case &c) { return c.line; });
+
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(Restore, SystemResetTest, ::testing::Values(
     Case{.line = "AT+QXRTALL=1", .trailer = "OK", .events = kFmt + kAsk1 + "modem clean_gprs_anite\n",
@@ -88,7 +91,7 @@ INSTANTIATE_TEST_SUITE_P(Restore, SystemResetTest, ::testing::Values(
     // An unreadable record is skipped, but a refusal writes the zeroed buffer back.
     Case{.line = "AT+QX_FRS_SHD=1,300,1", .fault = "nv-read", .trailer = "ATOK", .events = kFmt + kAsk2},
     Case{.line = "AT+QX_FRS_SHD=1,300,1", .fault = "nv-read", .app = "busy", .trailer = "ERROR",
-         .events = kFmt + "message system_restore 2 -> busy\n" + kNv, .nv = std::string(PYXA_NV_SIZE, '\0')}));
+         .events = kFmt + "message system_restore 2 -> busy\n" + kNv, .nv = std::string(PYXA_NV_SIZE, '\0')}), by_line);
 
 INSTANTIATE_TEST_SUITE_P(LogAndDump, SystemResetTest, ::testing::Values(
     Case{.line = "AT+QXLOG=0", .trailer = "OK", .events = "kaellog at_mode=0 mask=0x0\n"},
@@ -109,7 +112,7 @@ INSTANTIATE_TEST_SUITE_P(LogAndDump, SystemResetTest, ::testing::Values(
     Case{.line = "AT+QX_TRG_DUMP=0", .remove = "/proc/sysrq-trigger", .body = "\"errno:No such file or directory\"",
          .trailer = "ATNG"},
     Case{.line = "AT+QX_TRG_DUMP=00", .trailer = "ATERROR"},
-    Case{.line = "AT+QX_TRG_DUMP=1", .trailer = "ATERROR"}));
+    Case{.line = "AT+QX_TRG_DUMP=1", .trailer = "ATERROR"}), by_line);
 // clang-format on
 
 }  // namespace

@@ -11,6 +11,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
@@ -54,10 +55,15 @@ Daemon::Daemon(const Sandbox &b, const std::string &cmdline, bool wait_ready) : 
         setenv("FTCMD_TCP_PORT", std::to_string(port).c_str(), 1);
         setenv("FTCMD_LOCAL_SOCKET", local_name.c_str(), 1);
         setenv("FTCMD_SIM_LISTEN", "127.0.0.1", 1);
-        execl(FTCMD_BIN, "ftcmd", static_cast<char *>(nullptr));
+        // Another build of the daemon can be measured against this one (benchmarks).
+        const char *bin = getenv("FTCMD_DAEMON_BIN");
+        execl(bin != nullptr ? bin : FTCMD_BIN, "ftcmd", static_cast<char *>(nullptr));
         _exit(127);
     }
-    if (wait_ready && !wait_prop("sys.qrcode.view", "1")) throw std::runtime_error("daemon did not come up");
+    if (wait_ready && !wait_prop("sys.qrcode.view", "1")) {
+        stop(SIGKILL);  // no destructor runs for a half-made daemon: end it here
+        throw std::runtime_error("daemon did not come up");
+    }
 }
 
 Daemon::~Daemon() {
@@ -113,4 +119,28 @@ int Daemon::stop(int sig) {
     waitpid(pid, &status, 0);
     pid = -1;
     return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+}
+
+Pty::Pty(const Sandbox &box, const char *device) {
+    master = posix_openpt(O_RDWR | O_NOCTTY);
+    if (master < 0 || grantpt(master) != 0 || unlockpt(master) != 0) throw std::runtime_error("no pty");
+    slave = ptsname(master);
+    std::filesystem::create_directories(std::filesystem::path(box.path(device)).parent_path());
+    std::filesystem::create_symlink(slave, box.path(device));
+    keep = open(slave.c_str(), O_RDWR | O_NOCTTY);
+}
+
+Pty::~Pty() {
+    close(keep);
+    close(master);
+}
+
+bool Pty::send(const std::string &s) const { return write(master, s.data(), s.size()) == static_cast<ssize_t>(s.size()); }
+
+speed_t Pty::speed() const {
+    int fd = open(slave.c_str(), O_RDWR | O_NOCTTY);
+    struct termios t {};
+    tcgetattr(fd, &t);
+    close(fd);
+    return cfgetospeed(&t);
 }

@@ -2,6 +2,8 @@
 // Runs the real daemon binary on a sandbox and talks to it over its transports.
 #include <sys/types.h>
 
+#include <termios.h>
+
 #include <string>
 
 #include "tests/support/sandbox.h"
@@ -29,4 +31,20 @@ struct Daemon {
     int connect_local() const;
     // Sends a signal and returns the exit status (or 128+signal when killed by it).
     int stop(int sig);
+};
+
+// A pseudo-terminal whose slave the daemon opens as one of its serial ports: the test
+// is the station on the master side.
+struct Pty {
+    int master = -1;
+    int keep = -1;  // the slave held open, so that the master sees no hang-up on reopens
+    std::string slave;
+
+    Pty(const Sandbox &box, const char *device);
+    ~Pty();
+    Pty(const Pty &) = delete;
+    Pty &operator=(const Pty &) = delete;
+
+    bool send(const std::string &s) const;
+    speed_t speed() const;
 };

@@ -10,6 +10,7 @@
 #include "core/dispatch.h"
 #include "core/port_state.h"
 #include "core/response.h"
+#include "core/workers.h"
 #include "tests/support/daemon.h"
 #include "tests/support/sandbox.h"
 
@@ -24,6 +25,9 @@ protected:
         connect_source(SRC_TCP);
     }
     void TearDown() override {
+        // Workers the handlers started act on this sandbox: let them finish first. One
+        // that never ends by itself (its run flag still set) is given up on after a while.
+        if (!wait_workers_done(5000)) fprintf(stderr, "note: a worker is still running after its test\n");
         for (int fd : {g_port.uart_fd, g_port.usb_fd, g_port.tcp_client_fd, g_port.local_client_fd})
             if (fd >= 0) close(fd);
         if (station >= 0) close(station);
@@ -41,7 +45,7 @@ protected:
                     : src == SRC_LOCAL ? &g_port.local_client_fd
                                        : &g_port.tcp_client_fd;
         *slot = sv[1];
-        g_port.source_type = src;
+        force_current_source(src);
     }
 
     // Dispatches a received line as its transport would hand it over.
