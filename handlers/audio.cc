@@ -16,6 +16,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <new>
+#include <string_view>
 
 #include "core/command_tables/handlers.h"
 #include "core/port_state.h"
@@ -56,8 +57,9 @@ bool close_path() {
 
 // ---- arguments
 
-// The line cut at every "," in place (the handler's copy is its own to cut); empty
-// fields are kept. Fields beyond the last slot stay joined to it.
+// The line's non-empty ","-separated fields, cut in place as a tokeniser cuts them (the
+// handler's copy is its own to cut): "AT+QXMT=0,1,,70" has 70 as its third field. Fields
+// beyond the last slot are dropped.
 struct Fields {
     std::array<char *, 4> at{};
     int count = 0;
@@ -66,11 +68,11 @@ struct Fields {
 
 Fields split_fields(char *cmd) {
     Fields f;
-    f.at[f.count++] = cmd;
-    for (char *p = cmd; *p != '\0' && f.count < static_cast<int>(f.at.size()); ++p) {
-        if (*p != ',') continue;
-        *p = '\0';
-        f.at[f.count++] = p + 1;
+    for (std::string_view v : comma_fields(cmd)) {
+        if (f.count == static_cast<int>(f.at.size())) break;
+        char *field = cmd + (v.data() - cmd);
+        field[v.size()] = '\0';
+        f.at[f.count++] = field;
     }
     return f;
 }
@@ -309,7 +311,8 @@ void start_recording(const char *type, int32_t ms) {
         LOGE("no memory for the recording");
         return;
     }
-    snprintf(req->type, sizeof req->type, "%s", type);
+    // "AT+QX_AUD_RECD=2," names no type at all: the worker then refuses an empty one.
+    snprintf(req->type, sizeof req->type, "%s", type ? type : "");
     req->ms = ms;
     if (start_worker(audio_record_thread, req) != 0) {
         LOGE("record thread not started");
