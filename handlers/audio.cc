@@ -10,6 +10,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <chrono>
 #include <climits>
 #include <cstdint>
 #include <cstdio>
@@ -238,6 +239,8 @@ constexpr std::array<Mic, 5> kMics{{
 constexpr char kMicTypeNames[] = "MainMic SubMic STMic HPMic DoubleMic";
 constexpr int kRecordLimitMs = 30000;
 constexpr useconds_t kRecordPollUs = 10 * 1000;
+// How far past its limit a take may run on the monotonic clock before it is ended anyway.
+constexpr auto kRecordClockSlack = std::chrono::milliseconds(1000);
 
 // Handed to a recording worker, which frees it.
 struct RecordRequest {
@@ -265,6 +268,9 @@ void record_until_stopped(const Mic &mic, int32_t ms) {
     dev::gettimeofday(&start);
     const int32_t limit = ms > kRecordLimitMs ? kRecordLimitMs : ms;
     if (limit < 0) return;
+    // A take is timed on the phone's wall clock; one set back during it would keep the
+    // microphone open until the clock caught up, so a monotonic bound ends it regardless.
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(limit) + kRecordClockSlack;
     property_get(mic.busy, busy, "0");
     long long elapsed = 0;
     do {
@@ -273,7 +279,7 @@ void record_until_stopped(const Mic &mic, int32_t ms) {
         dev::gettimeofday(&now);
         elapsed = ms_between(start, now);
         property_get(mic.busy, busy, "0");
-    } while (limit >= elapsed);
+    } while (limit >= elapsed && std::chrono::steady_clock::now() < deadline);
 }
 
 void *audio_record_thread(void *arg) {

@@ -476,6 +476,14 @@ TEST_F(AudioTest, RecordingIsCappedAtThirtySeconds) {
     ASSERT_TRUE(wait_event(std::string("setprop ") + kMainBusy + "=0", 3000)) << box.events();
 }
 
+TEST_F(AudioTest, ClockSetBackDoesNotKeepARecordingOpen) {
+    EXPECT_EQ(serve("AT+QX_AUD_RECD=0,MainMic,1"), "AT+QX_AUD_RECD=0,MainMic,1\r\n\r\nATOK\r\n");
+    ASSERT_TRUE(wait_event(std::string("setprop ") + kMainBusy + "=1"));
+    box.write("/.sim/clock", "-3600\n");  // an hour back: the phone's clock alone would record for an hour
+    ASSERT_TRUE(wait_event(std::string("setprop ") + kMainBusy + "=0", 5000)) << box.events();
+    EXPECT_GE(box.read(kMainFile).size(), 44u + 1000 * 16);  // still the whole asked second
+}
+
 TEST_F(AudioTest, NegativeTimeRecordsNoLoop) {
     EXPECT_EQ(serve("AT+QX_AUD_RECD=0,HPMic,-1"), "AT+QX_AUD_RECD=0,HPMic,-1\r\n\r\nATOK\r\n");
     ASSERT_TRUE(wait_event("message set_silent_mode 1"));
