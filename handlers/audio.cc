@@ -16,6 +16,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <mutex>
 #include <new>
 #include <string_view>
 
@@ -353,11 +354,16 @@ constexpr size_t kCalibrateResultSize = 511;
 // The amplifiers of makers 1 and 2 need half a second before they can be calibrated.
 constexpr useconds_t kAmplifierSettleUs = 500 * 1000;
 
+// The AT+ZNGF=5 worker calibrates outside the dispatch mutex; the amplifier takes one
+// request at a time, so a line that reaches it meanwhile waits for the worker's to end.
+std::mutex g_amplifier;
+
 int speaker_amplifier_calibrate(char *text, size_t size) {
     if (text == nullptr || size < kCalibrateTextMin) {
         LOGE("priv null");
         return -1;
     }
+    std::lock_guard<std::mutex> one_at_a_time(g_amplifier);
     char result[kCalibrateTextSize] = "start calibrate fail";
     int maker = get_smartpa_manufacturer();
     if (maker == 1 || maker == 2) usleep(kAmplifierSettleUs);
@@ -641,17 +647,21 @@ int smart_speaker_Amplifier_calibrate_handler(char *cmd, int arg, char *resp) {
         return speaker_amplifier_calibrate(resp, kRespSize) == 0 ? RC_OK : RC_ERROR;
     }
     if (line_is(cmd, "AT+ZNGF=2")) {
+        std::unique_lock<std::mutex> one_at_a_time(g_amplifier);
         int status = smartpa_check_mtpex();
+        one_at_a_time.unlock();
         if (status < 0) return RC_ERROR;
         body_printf(resp, "\r\n%d\r\n", status);
         return RC_OK;
     }
     if (line_is(cmd, "AT+ZNGF=3")) {
+        std::unique_lock<std::mutex> one_at_a_time(g_amplifier);
         if (get_smartpa_manufacturer() != 0) {
             quote_reason(resp, "Not support");
             return RC_ERROR;
         }
         if (smartpa_reset_mtpex() < 0) return RC_ERROR;
+        one_at_a_time.unlock();
         set_amplifier_items("0");
         return RC_OK;
     }

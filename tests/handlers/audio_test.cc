@@ -519,6 +519,18 @@ TEST_F(AudioTest, CalibrationWorkerAnswersAtOnceAndCalibratesBehind) {
                                    "message speakerld 0 -> ok", kCalItem + "1 uart=0"});
 }
 
+TEST_F(AudioTest, LineCalibrationWaitsForTheWorkersToEnd) {
+    script(box, "smartpa_calibrate_ms=600");
+    EXPECT_EQ(serve("AT+ZNGF=5"), "AT+ZNGF=5\r\n\r\nOK\r\n");
+    ASSERT_TRUE(wait_event("get_smartpa_manufacturer()"));  // the worker's calibration is under way
+    EXPECT_EQ(serve("AT+ZNGF=apk"), "AT+ZNGF=apk\r\nR0=7.21ohm F0=812Hz\r\nOK\r\n");
+    std::vector<long long> ends;
+    for (const Event &e : box.event_list())
+        if (e.kind == "audio" && e.detail.rfind("smartpa_calibrate()", 0) == 0) ends.push_back(e.ms);
+    ASSERT_EQ(ends.size(), 2u) << box.events();
+    EXPECT_GE(ends[1] - ends[0], 600);  // the second tone started when the first had ended
+}
+
 // ---- results that change between calls, and the amplifier's settle time
 
 TEST_F(AudioTest, HeadsetPluggedBetweenTwoQueries) {
