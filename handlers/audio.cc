@@ -10,12 +10,15 @@
 #include <unistd.h>
 
 #include <array>
+#include <chrono>
 #include <climits>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <mutex>
 #include <new>
+#include <string_view>
 
 #include "core/command_tables/handlers.h"
 #include "core/port_state.h"
@@ -56,8 +59,9 @@ bool close_path() {
 
 // ---- arguments
 
-// The line cut at every "," in place (the handler's copy is its own to cut); empty
-// fields are kept. Fields beyond the last slot stay joined to it.
+// The line's non-empty ","-separated fields, cut in place as a tokeniser cuts them (the
+// handler's copy is its own to cut): "AT+QXMT=0,1,,70" has 70 as its third field. Fields
+// beyond the last slot are dropped.
 struct Fields {
     std::array<char *, 4> at{};
     int count = 0;
@@ -66,11 +70,11 @@ struct Fields {
 
 Fields split_fields(char *cmd) {
     Fields f;
-    f.at[f.count++] = cmd;
-    for (char *p = cmd; *p != '\0' && f.count < static_cast<int>(f.at.size()); ++p) {
-        if (*p != ',') continue;
-        *p = '\0';
-        f.at[f.count++] = p + 1;
+    for (std::string_view v : comma_fields(cmd)) {
+        if (f.count == static_cast<int>(f.at.size())) break;
+        char *field = cmd + (v.data() - cmd);
+        field[v.size()] = '\0';
+        f.at[f.count++] = field;
     }
     return f;
 }
@@ -236,6 +240,8 @@ constexpr std::array<Mic, 5> kMics{{
 constexpr char kMicTypeNames[] = "MainMic SubMic STMic HPMic DoubleMic";
 constexpr int kRecordLimitMs = 30000;
 constexpr useconds_t kRecordPollUs = 10 * 1000;
+// How far past its limit a take may run on the monotonic clock before it is ended anyway.
+constexpr auto kRecordClockSlack = std::chrono::milliseconds(1000);
 
 // Handed to a recording worker, which frees it.
 struct RecordRequest {
@@ -263,6 +269,9 @@ void record_until_stopped(const Mic &mic, int32_t ms) {
     dev::gettimeofday(&start);
     const int32_t limit = ms > kRecordLimitMs ? kRecordLimitMs : ms;
     if (limit < 0) return;
+    // A take is timed on the phone's wall clock; one set back during it would keep the
+    // microphone open until the clock caught up, so a monotonic bound ends it regardless.
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(limit) + kRecordClockSlack;
     property_get(mic.busy, busy, "0");
     long long elapsed = 0;
     do {
@@ -271,7 +280,7 @@ void record_until_stopped(const Mic &mic, int32_t ms) {
         dev::gettimeofday(&now);
         elapsed = ms_between(start, now);
         property_get(mic.busy, busy, "0");
-    } while (limit >= elapsed);
+    } while (limit >= elapsed && std::chrono::steady_clock::now() < deadline);
 }
 
 void *audio_record_thread(void *arg) {
@@ -309,7 +318,8 @@ void start_recording(const char *type, int32_t ms) {
         LOGE("no memory for the recording");
         return;
     }
-    snprintf(req->type, sizeof req->type, "%s", type);
+    // "AT+QX_AUD_RECD=2," names no type at all: the worker then refuses an empty one.
+    snprintf(req->type, sizeof req->type, "%s", type ? type : "");
     req->ms = ms;
     if (start_worker(audio_record_thread, req) != 0) {
         LOGE("record thread not started");
@@ -344,11 +354,16 @@ constexpr size_t kCalibrateResultSize = 511;
 // The amplifiers of makers 1 and 2 need half a second before they can be calibrated.
 constexpr useconds_t kAmplifierSettleUs = 500 * 1000;
 
+// The AT+ZNGF=5 worker calibrates outside the dispatch mutex; the amplifier takes one
+// request at a time, so a line that reaches it meanwhile waits for the worker's to end.
+std::mutex g_amplifier;
+
 int speaker_amplifier_calibrate(char *text, size_t size) {
     if (text == nullptr || size < kCalibrateTextMin) {
         LOGE("priv null");
         return -1;
     }
+    std::lock_guard<std::mutex> one_at_a_time(g_amplifier);
     char result[kCalibrateTextSize] = "start calibrate fail";
     int maker = get_smartpa_manufacturer();
     if (maker == 1 || maker == 2) usleep(kAmplifierSettleUs);
@@ -632,17 +647,21 @@ int smart_speaker_Amplifier_calibrate_handler(char *cmd, int arg, char *resp) {
         return speaker_amplifier_calibrate(resp, kRespSize) == 0 ? RC_OK : RC_ERROR;
     }
     if (line_is(cmd, "AT+ZNGF=2")) {
+        std::unique_lock<std::mutex> one_at_a_time(g_amplifier);
         int status = smartpa_check_mtpex();
+        one_at_a_time.unlock();
         if (status < 0) return RC_ERROR;
         body_printf(resp, "\r\n%d\r\n", status);
         return RC_OK;
     }
     if (line_is(cmd, "AT+ZNGF=3")) {
+        std::unique_lock<std::mutex> one_at_a_time(g_amplifier);
         if (get_smartpa_manufacturer() != 0) {
             quote_reason(resp, "Not support");
             return RC_ERROR;
         }
         if (smartpa_reset_mtpex() < 0) return RC_ERROR;
+        one_at_a_time.unlock();
         set_amplifier_items("0");
         return RC_OK;
     }

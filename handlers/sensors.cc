@@ -17,6 +17,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <mutex>
 
 #include "core/command_tables/handlers.h"
 #include "core/nv.h"
@@ -106,6 +107,8 @@ std::atomic<unsigned char> g_gsensor_stream{0};
 // Set by the first gyroscope self-check that passes; never cleared.
 std::atomic<unsigned char> g_gyro_check_passed{0};
 
+std::mutex g_calibration_results;
+
 struct FreeResult {
     void operator()(SensorTestResult *r) const { free(r); }
 };
@@ -194,6 +197,10 @@ int calibrate(const Calibration &c, char *resp) {
     }
     const int offsets[3] = {trunc_to_int(sensor_word(*r, kSensorX)), trunc_to_int(sensor_word(*r, kSensorY)),
                             trunc_to_int(sensor_word(*r, kSensorZ))};
+    // Calibration workers run outside the dispatch mutex, and the accelerometer's and the
+    // gyroscope's may run at once: their read-change-write of the one NV record and their
+    // files are taken in turn, so neither result overwrites the other's.
+    std::lock_guard<std::mutex> one_result_at_a_time(g_calibration_results);
     nv::Update u = nv::update([&](nv::Record &rec) {
         for (int i = 0; i < 3; ++i) rec.set_i32(c.nv_offsets + 4 * i, offsets[i]);
         rec.set_i32(c.nv_flag, 1);
@@ -317,8 +324,9 @@ int start_z_stream() {
     g_gsensor_stream = 1;
     int rc = start_worker(update_gsensor_z_thread, nullptr);
     if (rc != 0) {
+        // The flag stays set, as after a stream that a failed reading ended: only
+        // AT+QXZLJC=0,0 clears it.
         LOGE("fail to create gps_test_thread errno:%d,%d", rc, errno);
-        g_gsensor_stream = 0;  // no stream runs, so a later start must not be told "running"
         return RC_ERROR;
     }
     return RC_OK;

@@ -160,6 +160,9 @@ INSTANTIATE_TEST_SUITE_P(Loopbacks, AudioLine, ::testing::Values(
     Case{"EmptyGain", 5, "AT+QXMTE=1,", nullptr, "", "ERROR", {}, 5},
     Case{"HugeGain", 0, "AT+QXMTE=1,99999999999", nullptr, "", "OK", {"startMic2headset(2147483647) -> 0"}, 7},
     Case{"ExtraField", 0, "AT+QXMTE=1,80,5", nullptr, "", "OK", {"startMic2headset(80) -> 0"}, 7},
+    // The line is cut as a tokeniser cuts it: an empty field is no field.
+    Case{"EmptyFieldSkipped", 0, "AT+QXMTE=1,,50", nullptr, "", "OK", {"startMic2headset(50) -> 0"}, 7},
+    Case{"EmptyFieldSkipped", 0, "AT+QXEMTSA=1,30,,40", nullptr, "", "OK", {"startHeadset2SpeakerWithGain(30,40) -> 0"}, 12},
     Case{"", 7, "AT+QXMTE=0", nullptr, "", "OK", {"exitMic2headset() -> 0"}, 0},
     Case{"ClosesAnyPath", 12, "AT+QXMTE=0", nullptr, "", "OK", {"exitMic2headset() -> 0"}, 0},
     Case{"ExitFails", 7, "AT+QXMTE=0", exit_fails, "", "OK", {"exitMic2headset() -> 3"}, 0},
@@ -190,6 +193,7 @@ INSTANTIATE_TEST_SUITE_P(Loopbacks, AudioLine, ::testing::Values(
 INSTANTIATE_TEST_SUITE_P(Echo, AudioLine, ::testing::Values(
     Case{"", 0, "AT+QXMT=0,1", nullptr, "", "OK", {"startReceiveTest(100) -> 0"}, 3},
     Case{"", 0, "AT+QXMT=0,1,70", nullptr, "", "OK", {"startReceiveTest(70) -> 0"}, 3},
+    Case{"EmptyGainIsNoGain", 0, "AT+QXMT=0,1,", nullptr, "", "OK", {"startReceiveTest(100) -> 0"}, 3},
     Case{"Reopen", 3, "AT+QXMT=0,1", nullptr, "", "ATOK", {}, 3},
     Case{"Fails", 0, "AT+QXMT=0,1", receive_fails, "", "ERROR", {"startReceiveTest(100) -> -2"}, 3},
     Case{"", 3, "AT+QXMT=0,0", nullptr, "", "OK", {"exitReceiveTest() -> 0"}, 0},
@@ -244,6 +248,8 @@ INSTANTIATE_TEST_SUITE_P(Playback, AudioLine, ::testing::Values(
     Case{"Reopen", 20, "AT+QXPTS=1," + kTone, nullptr, "", "OK", {}, 20},
     Case{"Missing", 0, "AT+QXPTS=1,/sdcard/music/none.wav", nullptr, "", "ERROR", {}, 0},
     Case{"NoPath", 0, "AT+QXPTS=1", nullptr, "", "ERROR", {}, 0},
+    Case{"EmptyFieldSkipped", 0, "AT+QXPTS=1,," + kTone, nullptr, "", "OK",
+         {"audio_ftm_process_full(22,1,1,/sdcard/music/tone.wav) -> 0"}, 20},
     Case{"Fails", 0, "AT+QXPTS=1," + kTone, tone_fails, "", "ERROR",
          {"audio_ftm_process_full(22,1,1,/sdcard/music/tone.wav) -> -5"}, 20},
     Case{"", 20, "AT+QXPTS=0", nullptr, "", "OK", {"audio_ftm_process_full(22,0,1) -> 0"}, 0},
@@ -256,6 +262,9 @@ INSTANTIATE_TEST_SUITE_P(Playback, AudioLine, ::testing::Values(
     Case{"Lowered", 0, "AT+QXPTRTS=1,/SDCARD/MUSIC/TONE.WAV", nullptr, "", "OK",
          {"audio_ftm_process(25,1,100,/sdcard/music/tone.wav) -> 0"}, 28},
     Case{"NoPath", 0, "AT+QXPTRTS=1", nullptr, "", "ERROR", {}, 0},
+    Case{"EmptyPathIsNoPath", 0, "AT+QXPTRTS=1,", nullptr, "", "ERROR", {}, 0},
+    Case{"EmptyVolumeIsNoVolume", 0, "AT+QXPTRTS=1,," + kTone, nullptr, "", "OK",
+         {"audio_ftm_process(25,1,100,/sdcard/music/tone.wav) -> 0"}, 28},
     Case{"Missing", 0, "AT+QXPTRTS=1,/sdcard/none.wav", nullptr, "\"file not exisit.\"", "ERROR", {}, 0},
     Case{"Reopen", 28, "AT+QXPTRTS=1," + kTone, nullptr, "", "ATOK", {}, 28},
     Case{"Fails", 0, "AT+QXPTRTS=1," + kTone, audio_fault, "", "ERROR", {"audio_ftm_process(25,1,100,/sdcard/music/tone.wav) -> -1"}, 28},
@@ -380,6 +389,7 @@ INSTANTIATE_TEST_SUITE_P(RecordingForms, AudioLine, ::testing::Values(
     Case{"", 0, "AT+QX_AUD_RECD=3,HPMic", [](const Sandbox &b) { b.set_prop("sys.is_audio_working.hp_mic", "1"); }, "", "ATOK",
          {}, 0, {"setprop sys.is_audio_working.hp_mic=0"}, {{"sys.is_audio_working.hp_mic", "0"}}},
     Case{"Unknown", 0, "AT+QX_AUD_RECD=3,hpmic", nullptr, "\"mic-type set error!!\"", "ERROR", {}, 0},
+    Case{"NoType", 0, "AT+QX_AUD_RECD=2,", nullptr, "", "ATOK", {}, 0},
     Case{"", 0, "AT+QX_AUD_RECD=1", nullptr, "\"parameter error\"", "ATERROR", {}, 0},
     Case{"", 0, "AT+QX_AUD_RECD=4,MainMic", nullptr, "\"parameter error\"", "ATERROR", {}, 0}), line_name);
 
@@ -466,6 +476,14 @@ TEST_F(AudioTest, RecordingIsCappedAtThirtySeconds) {
     ASSERT_TRUE(wait_event(std::string("setprop ") + kMainBusy + "=0", 3000)) << box.events();
 }
 
+TEST_F(AudioTest, ClockSetBackDoesNotKeepARecordingOpen) {
+    EXPECT_EQ(serve("AT+QX_AUD_RECD=0,MainMic,1"), "AT+QX_AUD_RECD=0,MainMic,1\r\n\r\nATOK\r\n");
+    ASSERT_TRUE(wait_event(std::string("setprop ") + kMainBusy + "=1"));
+    box.write("/.sim/clock", "-3600\n");  // an hour back: the phone's clock alone would record for an hour
+    ASSERT_TRUE(wait_event(std::string("setprop ") + kMainBusy + "=0", 5000)) << box.events();
+    EXPECT_GE(box.read(kMainFile).size(), 44u + 1000 * 16);  // still the whole asked second
+}
+
 TEST_F(AudioTest, NegativeTimeRecordsNoLoop) {
     EXPECT_EQ(serve("AT+QX_AUD_RECD=0,HPMic,-1"), "AT+QX_AUD_RECD=0,HPMic,-1\r\n\r\nATOK\r\n");
     ASSERT_TRUE(wait_event("message set_silent_mode 1"));
@@ -499,6 +517,18 @@ TEST_F(AudioTest, CalibrationWorkerAnswersAtOnceAndCalibratesBehind) {
     ASSERT_TRUE(wait_event(kCalItem + "1"));
     expect_in_order(box.events(), {"message speakerld 2 -> ok", "audio " + kMaker0, "audio " + kCalOk,
                                    "message speakerld 0 -> ok", kCalItem + "1 uart=0"});
+}
+
+TEST_F(AudioTest, LineCalibrationWaitsForTheWorkersToEnd) {
+    script(box, "smartpa_calibrate_ms=600");
+    EXPECT_EQ(serve("AT+ZNGF=5"), "AT+ZNGF=5\r\n\r\nOK\r\n");
+    ASSERT_TRUE(wait_event("get_smartpa_manufacturer()"));  // the worker's calibration is under way
+    EXPECT_EQ(serve("AT+ZNGF=apk"), "AT+ZNGF=apk\r\nR0=7.21ohm F0=812Hz\r\nOK\r\n");
+    std::vector<long long> ends;
+    for (const Event &e : box.event_list())
+        if (e.kind == "audio" && e.detail.rfind("smartpa_calibrate()", 0) == 0) ends.push_back(e.ms);
+    ASSERT_EQ(ends.size(), 2u) << box.events();
+    EXPECT_GE(ends[1] - ends[0], 600);  // the second tone started when the first had ended
 }
 
 // ---- results that change between calls, and the amplifier's settle time
