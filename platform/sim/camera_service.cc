@@ -55,6 +55,7 @@ int transform_at_cmd_to_camera_info(const char *command, char *msg, int msg_len,
     if (eq == std::string::npos || c.compare(0, 3, "AT+") != 0 || sim::fault("camera-transform")) return -1;
     std::string name = c.substr(3, eq - 3), args = c.substr(eq + 1), m = "eng_AT_camera#";
     for (char ch : name) m += static_cast<char>(tolower(static_cast<unsigned char>(ch)));
+    m += '#';
     for (char ch : args) m += ch == ',' ? '#' : ch;
     put(msg, msg_len, m);
     std::string upper;
