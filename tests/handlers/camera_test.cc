@@ -84,6 +84,10 @@ protected:
         InProcess::SetUp();
         box.write("/.sim/nv.bin", nv_pattern());
     }
+    void TearDown() override {
+        is_uart_flag = 0;
+        InProcess::TearDown();
+    }
 };
 class CameraLine : public CameraTest, public ::testing::WithParamInterface<Case> {};
 
@@ -164,6 +168,7 @@ INSTANTIATE_TEST_SUITE_P(GatedForms, CameraLine, ::testing::Values(
     // The count is cut where the 48-byte message ends.
     Case{"AT+MMICCM=BB,10,123456789012345678901234", nullptr, "", "OK",
          {"camera long_shot#value start#number 123456789012345678 -> "}},
+    Case{"AT+MMICCM=BB,100", nullptr, "", "OK", {"camera long_shot#value start# -> "}, {}, {}, "PrefixOnly"},
     Case{"AT+MMICCM=BB,10,9", all_fail, "fail#busy", "ERROR", {}, {}, {}, "CameraFails"},
     Case{"AT+MMICCM=BB,10", gated, kGate, "ATERROR", {}, {"camera"}, {}, "Gated"},
     Case{"AT+MMICCM=BB,11", nullptr, "", "OK", {"camera long_shot#value stop# -> success"}},
@@ -313,6 +318,8 @@ INSTANTIATE_TEST_SUITE_P(NewerInterface, CameraLine, ::testing::Values(
          "\r\n\"+shift:0.8\"\r\n\r\n\"+conf:97\"\r\n", "ATOK", {"calibrate pdaf_calibration=1"}, {}, {}, "Values"},
     Case{"AT+QX_CCM_PDAF=1,rear", [](const Sandbox &b) { pdaf_reply(b, "fail#no target"); }, "\"fail#no target\"", "ATNG", {},
          {"calibrate"}, {}, "CameraFails"},
+    Case{"AT+QX_CCM_PDAF=1,rear", [](const Sandbox &) { is_uart_flag = 1; }, "", "ATOK",
+         {"calibrate pdaf_calibration=1 uart=1"}, {}, {}, "UartConsole"},
     Case{"AT+QX_CCM_PDAF=1,rear", [](const Sandbox &b) { b.fault("calibrate-item"); }, "save_ret=-5", "ATNG",
          {"calibrate pdaf_calibration=1 uart=0 (failed)"}, {}, {}, "ItemNotSaved"},
     Case{"AT+QX_CCM_PDAF=1,rear", [](const Sandbox &b) { config(b, "camera_item.AT+QX_CCM_PDAF", "ab"); }, "", "ATOK", {},
@@ -332,12 +339,56 @@ INSTANTIATE_TEST_SUITE_P(NewerInterface, CameraLine, ::testing::Values(
     case_name);
 
 TEST_F(CameraTest, PdafMarkerFollowsTheLastTest) {
-    EXPECT_EQ(serve("AT+MMICCM=B,7"), "AT+MMICCM=B,7\r\n\r\nATNG\r\n");
-    EXPECT_EQ(serve("AT+MMICCM=B,6"), "AT+MMICCM=B,6\r\n\r\nOK\r\n");
-    EXPECT_EQ(serve("AT+MMICCM=BB,7"), "AT+MMICCM=BB,7\r\n\r\nOK\r\n");
-    camera_says(box, "pdaf_test", "fail#out of range");
-    EXPECT_EQ(serve("AT+MMICCM=BB,6"), "AT+MMICCM=BB,6\r\n\r\nATNG\r\n");
-    EXPECT_EQ(serve("AT+MMICCM=B,7"), "AT+MMICCM=B,7\r\n\r\nATNG\r\n");
+    box.sequence("camera:pdaf_test", {"success", "fail#out of range"});
+    EXPECT_EQ(serve("AT+MMICCM=B,7", SRC_TCP, 23), "AT+MMICCM=B,7\r\n\r\nATNG\r\n");
+    EXPECT_EQ(serve("AT+MMICCM=B,6", SRC_TCP, 21), "AT+MMICCM=B,6\r\n\r\nOK\r\n");
+    EXPECT_EQ(serve("AT+MMICCM=BB,7", SRC_TCP, 22), "AT+MMICCM=BB,7\r\n\r\nOK\r\n");
+    EXPECT_EQ(serve("AT+MMICCM=BB,6", SRC_TCP, 24), "AT+MMICCM=BB,6\r\n\r\nATNG\r\n");
+    EXPECT_EQ(serve("AT+MMICCM=B,7", SRC_TCP, 23), "AT+MMICCM=B,7\r\n\r\nATNG\r\n");
+    expect_in_order(box.events(), {"camera pdaf_test -> success", "touch /data/engineermode/pdaf_test",
+                                   "camera pdaf_test -> fail#out of range"});
+}
+
+TEST_F(CameraTest, EachLightLeakReadingIsJudgedAlone) {
+    box.sequence("camera:front_light_leak", {"success#leak#998.9", "success#leak#-1000", "fail#cover open", "success#leak#0"});
+    const struct {
+        const char *body, *word;
+    } answers[] = {{"\r\n\"+Light:998.9\"\r\n", "ATOK"},
+                   {"\r\n\"+Light:-1000\"\r\n", "ATNG"},
+                   {"", "ATERROR"},
+                   {"\r\n\"+Light:0\"\r\n", "ATOK"}};
+    for (const auto &a : answers) {
+        const std::string frame = std::string("AT+MMICCM=F,11\r\n") + a.body + "\r\n" + a.word + "\r\n";
+        EXPECT_EQ(serve("AT+MMICCM=F,11", SRC_TCP, frame.size()), frame);
+    }
+}
+
+TEST_F(CameraTest, SelfTestResultsChangeBetweenReads) {
+    const std::string get = "eng_AT_camera#rear#main#auto_test_get_result#params 0";
+    box.sequence("camera:" + get, {"success#r#af 0#ae 0", "success#r#af 1#ae 1"});
+    const std::string line = "AT+QX_CCM_SLTS=3,rear,main,0";
+    EXPECT_EQ(serve("AT+QX_CCM_SLTS=1,rear,main,0", SRC_TCP, 36), "AT+QX_CCM_SLTS=1,rear,main,0\r\n\r\nATOK\r\n");
+    const std::string first = line + "\r\n\r\n\"+af:0\"\r\n\r\n\"+ae:0\"\r\n\r\nATOK\r\n";
+    EXPECT_EQ(serve(line, SRC_TCP, first.size()), first);
+    const std::string second = line + "\r\n\r\n\"+af:1\"\r\n\r\n\"+ae:1\"\r\n\r\nATOK\r\n";
+    EXPECT_EQ(serve(line, SRC_TCP, second.size()), second);
+    // The camera service is asked once per line, in the station's order.
+    std::vector<Event> camera;
+    for (const Event &e : box.event_list())
+        if (e.kind == "camera") camera.push_back(e);
+    ASSERT_EQ(camera.size(), 3u);
+    EXPECT_EQ(camera[0].detail, "eng_AT_camera#rear#main#auto_test_execute#params 0 -> success");
+    EXPECT_EQ(camera[2].detail, get + " -> success#r#af 1#ae 1");
+    EXPECT_LE(camera[0].ms, camera[1].ms);
+    EXPECT_LE(camera[1].ms, camera[2].ms);
+}
+
+TEST_F(CameraTest, SensorIdsAreReadAfreshEachTime) {
+    box.sequence("/sys/ccm/RearSensorId", {"imx586", "imx766"});
+    for (const char *id : {"imx586", "imx766"}) {
+        const std::string frame = std::string("AT+QXCCMID=0\r\n\r\n\"front:s5k3p9sp\n\r\nback:") + id + "\n\"\r\n \r\nOK\r\n";
+        EXPECT_EQ(serve("AT+QXCCMID=0", SRC_TCP, frame.size()), frame);
+    }
 }
 
 }  // namespace
