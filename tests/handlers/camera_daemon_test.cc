@@ -7,6 +7,7 @@
 #include <chrono>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include "tests/support/daemon.h"
 #include "tests/support/sandbox.h"
@@ -23,38 +24,40 @@ std::string exchange(int fd, const std::string &line, size_t want) {
     return read_some(fd, want);
 }
 
-// Milliseconds from since until node reads text, or -1 after limit_ms.
-long long wait_node(const Sandbox &box, const char *node, const std::string &text, Clock::time_point since, int limit_ms) {
-    while (Clock::now() - since < std::chrono::milliseconds(limit_ms)) {
-        if (box.read(node) == text)
-            return std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - since).count();
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+// The flash driver's records ("<node> <level>" with their times), once there are count
+// of them or limit_ms have passed.
+std::vector<Event> wait_flashes(const Sandbox &box, size_t count, int limit_ms) {
+    const auto since = Clock::now();
+    std::vector<Event> got;
+    for (;;) {
+        got.clear();
+        for (const Event &e : box.event_list())
+            if (e.kind == "flash") got.push_back(e);
+        if (got.size() >= count || Clock::now() - since > std::chrono::milliseconds(limit_ms)) return got;
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
     }
-    return -1;
 }
 
 TEST(CameraDaemon, FrontTorchTimerIsCappedAtTenSecondsAndClosesTheRearFlash) {
     Sandbox box;
-    box.write("/sys/ext_led/EXT_REAR_FLASH_LED1", "75");
     Daemon d(box);
     int s = d.connect_tcp();
     ASSERT_GE(s, 0);
     const std::string frame = "AT+FLAMP=0,1,20000\r\n\r\nOK\r\n";
-    const auto start = Clock::now();
     EXPECT_EQ(exchange(s, "AT+FLAMP=0,1,20000", frame.size()), frame);
-    EXPECT_EQ(box.read("/sys/ext_led/EXT_FRONT_FLASH_LED"), "75");
     // The station is served while the timer runs.
     const std::string pulse = "AT+FLAMP=1,1,2000\r\n\r\nOK\r\n";
-    const auto pulse_start = Clock::now();
     EXPECT_EQ(exchange(s, "AT+FLAMP=1,1,2000", pulse.size()), pulse);
-    EXPECT_EQ(box.read("/sys/ext_led/EXT_REAR_FLASH_LED1"), "900");
-    long long pulse_ms = wait_node(box, "/sys/ext_led/EXT_REAR_FLASH_LED1", "0", pulse_start, 3000);
-    EXPECT_GE(pulse_ms, 490);
-    EXPECT_LT(pulse_ms, 2000);
-    box.write("/sys/ext_led/EXT_REAR_FLASH_LED1", "75");
-    long long torch_ms = wait_node(box, "/sys/ext_led/EXT_REAR_FLASH_LED1", "0", start, 14000);
-    EXPECT_GE(torch_ms, 9990);
-    EXPECT_LT(torch_ms, 12000);
+    std::vector<Event> f = wait_flashes(box, 4, 14000);
+    ASSERT_EQ(f.size(), 4u) << box.events();
+    EXPECT_EQ(f[0].detail, "EXT_FRONT_FLASH_LED 75");
+    EXPECT_EQ(f[1].detail, "EXT_REAR_FLASH_LED1 900");
+    EXPECT_EQ(f[2].detail, "EXT_REAR_FLASH_LED1 0");
+    EXPECT_EQ(f[3].detail, "EXT_REAR_FLASH_LED1 0");
+    EXPECT_GE(f[2].ms - f[1].ms, 499);  // the pulse's 2000 ms are cut to 500
+    EXPECT_LT(f[2].ms - f[1].ms, 1500);
+    EXPECT_GE(f[3].ms - f[0].ms, 9999);  // the torch's 20000 ms are cut to 10000
+    EXPECT_LT(f[3].ms - f[0].ms, 11000);
     EXPECT_EQ(box.read("/sys/ext_led/EXT_FRONT_FLASH_LED"), "75") << "the front torch stays on until AT+FLAMP=0,0";
     const std::string off = "AT+FLAMP=0,0\r\n\r\nOK\r\n";
     EXPECT_EQ(exchange(s, "AT+FLAMP=0,0", off.size()), off);

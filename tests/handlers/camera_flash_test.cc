@@ -57,14 +57,22 @@ protected:
         is_sp = 0;
         InProcess::TearDown();
     }
-    // Polls a node until it reads text; the time it took, or -1 after limit_ms.
-    long long wait_node(const char *node, const std::string &text, Clock::time_point since, int limit_ms) {
-        while (Clock::now() - since < std::chrono::milliseconds(limit_ms)) {
-            if (box.read(node) == text)
-                return std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - since).count();
+    // The flash driver's records, "<node> <level>" with their times.
+    std::vector<Event> flashes() const {
+        std::vector<Event> out;
+        for (const Event &e : box.event_list())
+            if (e.kind == "flash") out.push_back(e);
+        return out;
+    }
+    // Waits (bounded) until the flash driver has taken count writes; they are returned.
+    std::vector<Event> wait_flashes(size_t count, int limit_ms) const {
+        const auto since = Clock::now();
+        std::vector<Event> got = flashes();
+        while (got.size() < count && Clock::now() - since < std::chrono::milliseconds(limit_ms)) {
             std::this_thread::sleep_for(std::chrono::milliseconds(5));
+            got = flashes();
         }
-        return -1;
+        return got;
     }
 };
 class FlashLine : public FlashTest, public ::testing::WithParamInterface<Case> {};
@@ -111,9 +119,11 @@ INSTANTIATE_TEST_SUITE_P(PulseOff, FlashLine, ::testing::Values(
     Case{"AT+FLAMP=0,0", lit, "", "OK", {{kFront, "0"}, {kLed1, "75"}}},
     Case{"AT+FLAMP=0,0", [](const Sandbox &b) { remove_node(b, kFront); }, "", "OK", {}, {}, "NoFrontFlash"},
     Case{"AT+FLAMP=1,0", lit, "", "OK", {{kLed1, "0"}, {kLed, kGone}, {kFront, "75"}}},
-    Case{"AT+FLAMP=1,0", [](const Sandbox &b) { lit(b), both_names(b); }, "", "OK", {{kLed1, "0"}, {kLed, "0"}}, {},
+    Case{"AT+FLAMP=1,0", [](const Sandbox &b) { lit(b), both_names(b); }, "", "OK", {{kLed1, "0"}, {kLed, "0"}},
+         {"flash EXT_REAR_FLASH_LED1 0", "flash EXT_REAR_FLASH_LED 0"},
          "BothNames"},
-    Case{"AT+FLAMP=2,0", [](const Sandbox &b) { lit(b), both_names(b); }, "", "OK", {{kLed2, "0"}, {kLed, "0"}, {kLed1, "75"}}},
+    Case{"AT+FLAMP=2,0", [](const Sandbox &b) { lit(b), both_names(b); }, "", "OK", {{kLed2, "0"}, {kLed, "0"}, {kLed1, "75"}},
+         {"flash EXT_REAR_FLASH_LED2 0", "flash EXT_REAR_FLASH_LED 0"}},
     Case{"AT+FLAMP=1,1", [](const Sandbox &b) { remove_node(b, kLed1); }, "", "ERROR", {{kLed, kGone}}, {}, "NoRearFlash"},
     Case{"AT+FLAMP=2,1", [](const Sandbox &b) { remove_node(b, kLed2); }, "", "ATNG", {}, {}, "NoSecondFlash"},
     Case{"AT+FLAMP=3,1", nullptr, "", "ERROR"},
@@ -152,11 +162,11 @@ INSTANTIATE_TEST_SUITE_P(Infrared, FlashLine, ::testing::Values(
     case_name);
 
 // A pulse's level at once, and its timer's delay: node written back to "0".
+// A pulse: the write that lights it, and the timer's write of 0 after its delay.
 struct Pulse {
     const char *line;
-    const char *node;      // lit by the line
-    const char *level;
-    const char *closed;    // closed by the timer
+    const char *on;   // the flash driver's record of the line's write
+    const char *off;  // ... and of the timer's
     int delay_ms;
     const char *word;
     const char *name;
@@ -166,54 +176,52 @@ class FlashPulse : public FlashTest, public ::testing::WithParamInterface<Pulse>
 
 TEST_P(FlashPulse, ClosesAfterItsDelay) {
     const Pulse &p = GetParam();
-    box.write(p.closed, "75");
-    const std::string line = p.line;
-    const auto start = Clock::now();
-    const std::string frame = line + "\r\n\r\n" + p.word + "\r\n";
+    const std::string line = p.line, frame = line + "\r\n\r\n" + p.word + "\r\n";
     EXPECT_EQ(serve(line, SRC_TCP, frame.size()), frame);
-    if (p.node != p.closed || p.delay_ms >= 100) {
-        EXPECT_EQ(box.read(p.node), p.level);
-    }
-    long long took = wait_node(p.closed, "0", start, p.delay_ms + 3000);
-    ASSERT_GE(took, 0) << p.closed << " never closed";
-    EXPECT_GE(took, p.delay_ms - 5);
-    EXPECT_LT(took, p.delay_ms + 1500);
-    if (p.node != p.closed) {
-        EXPECT_EQ(box.read(p.node), p.level) << "the timer closes only its own node";
-    }
+    std::vector<Event> f = wait_flashes(2, p.delay_ms + 3000);
+    ASSERT_EQ(f.size(), 2u) << box.events();
+    EXPECT_EQ(f[0].detail, p.on);
+    EXPECT_EQ(f[1].detail, p.off);
+    EXPECT_GE(f[1].ms - f[0].ms, p.delay_ms - 1);  // the times are whole milliseconds
+    EXPECT_LT(f[1].ms - f[0].ms, p.delay_ms + 1000);
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    EXPECT_EQ(flashes().size(), 2u) << "one write of 0, and nothing after it";
 }
 
 INSTANTIATE_TEST_SUITE_P(Timers, FlashPulse, ::testing::Values(
-    Pulse{"AT+FLAMP=1,1", kLed1, "900", kLed1, 500, "OK", "RearDefault"},
-    Pulse{"AT+FLAMP=1,1,100", kLed1, "900", kLed1, 100, "OK", "RearGiven"},
-    Pulse{"AT+FLAMP=1,1,2000", kLed1, "900", kLed1, 500, "OK", "RearCapped"},
-    Pulse{"AT+FLAMP=1,1,-40", kLed1, "900", kLed1, 0, "OK", "RearNegativeClosesAtOnce"},
-    Pulse{"AT+FLAMP=2,1", kLed2, "900", kLed2, 500, "ATOK", "SecondDefault"},
-    Pulse{"AT+FLAMP=2,1,2000", kLed2, "900", kLed2, 500, "ATOK", "SecondCapped"},
+    Pulse{"AT+FLAMP=1,1", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 500, "OK", "RearDefault"},
+    Pulse{"AT+FLAMP=1,1,100", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 100, "OK", "RearGiven"},
+    Pulse{"AT+FLAMP=1,1,2000", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 500, "OK", "RearCapped"},
+    Pulse{"AT+FLAMP=1,1,-40", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 0, "OK", "RearNegativeClosesAtOnce"},
+    Pulse{"AT+FLAMP=2,1", "EXT_REAR_FLASH_LED2 900", "EXT_REAR_FLASH_LED2 0", 500, "ATOK", "SecondDefault"},
+    Pulse{"AT+FLAMP=2,1,2000", "EXT_REAR_FLASH_LED2 900", "EXT_REAR_FLASH_LED2 0", 500, "ATOK", "SecondCapped"},
     // The front torch stays on; its timer closes the rear main flash.
-    Pulse{"AT+FLAMP=0,1", kFront, "75", kLed1, 200, "OK", "FrontTorchDefault"},
-    Pulse{"AT+FLAMP=0,1,700", kFront, "75", kLed1, 700, "OK", "FrontTorchGiven"},
-    Pulse{"AT+QX_FLED_INF=3,1", kFront, "75", kFront, 3000, "ATOK", "InfraredThreeSeconds"}),
+    Pulse{"AT+FLAMP=0,1", "EXT_FRONT_FLASH_LED 75", "EXT_REAR_FLASH_LED1 0", 200, "OK", "FrontTorchDefault"},
+    Pulse{"AT+FLAMP=0,1,700", "EXT_FRONT_FLASH_LED 75", "EXT_REAR_FLASH_LED1 0", 700, "OK", "FrontTorchGiven"},
+    Pulse{"AT+QX_FLED_INF=3,1", "EXT_FRONT_FLASH_LED 75", "EXT_FRONT_FLASH_LED 0", 3000, "ATOK", "InfraredThreeSeconds"}),
     [](const ::testing::TestParamInfo<Pulse> &info) { return std::string(info.param.name); });
 
 TEST_F(FlashTest, RearTimerClosesTheOlderNodeToo) {
     old_board(box);
-    const auto start = Clock::now();
     EXPECT_EQ(serve("AT+FLAMP=1,1,150", SRC_TCP, 24), "AT+FLAMP=1,1,150\r\n\r\nOK\r\n");
-    EXPECT_EQ(box.read(kLed), "900");
-    EXPECT_GE(wait_node(kLed, "0", start, 3000), 145);
+    std::vector<Event> f = wait_flashes(2, 3000);
+    ASSERT_EQ(f.size(), 2u) << box.events();
+    EXPECT_EQ(f[0].detail, "EXT_REAR_FLASH_LED 900");
+    EXPECT_EQ(f[1].detail, "EXT_REAR_FLASH_LED 0");
+    EXPECT_GE(f[1].ms - f[0].ms, 149);
     EXPECT_FALSE(box.exists(kLed1));
 }
 
 TEST_F(FlashTest, OverlappingTimersEachCloseAtTheirOwnTime) {
-    const auto start = Clock::now();
     EXPECT_EQ(serve("AT+FLAMP=1,1,400", SRC_TCP, 24), "AT+FLAMP=1,1,400\r\n\r\nOK\r\n");
     EXPECT_EQ(serve("AT+FLAMP=1,1,100", SRC_TCP, 24), "AT+FLAMP=1,1,100\r\n\r\nOK\r\n");
-    long long first = wait_node(kLed1, "0", start, 3000);
-    EXPECT_GE(first, 95);
-    box.write(kLed1, "900");  // lit again by hand: the first timer still closes it
-    long long second = wait_node(kLed1, "0", start, 3000);
-    EXPECT_GE(second, 395);
+    std::vector<Event> f = wait_flashes(4, 3000);
+    ASSERT_EQ(f.size(), 4u) << box.events();
+    for (size_t i : {0, 1}) EXPECT_EQ(f[i].detail, "EXT_REAR_FLASH_LED1 900");
+    for (size_t i : {2, 3}) EXPECT_EQ(f[i].detail, "EXT_REAR_FLASH_LED1 0");
+    EXPECT_GE(f[2].ms - f[1].ms, 99);   // the later, shorter pulse closes first
+    EXPECT_GE(f[3].ms - f[0].ms, 399);  // and the first timer still writes 0 at its time
+    EXPECT_LT(f[2].ms, f[3].ms);
 }
 
 }  // namespace
