@@ -108,14 +108,15 @@ bool start_timer(void *(*timer)(void *), int delay) {
     return true;
 }
 
-// The delay of an AT+FLAMP pulse: the line's third ","-field, read as atoi reads it.
-// A negative delay would sleep for ever; it closes at once instead.
+// The delay of an AT+FLAMP pulse: the line's third ","-field, read as atoi reads it
+// (leading digits, 0 when there are none). A number too large for an int is capped like
+// any other long delay, and a negative one, which would sleep for ever, closes at once.
 int pulse_ms(const char *cmd, TimerLimits limits) {
     std::optional<std::string_view> field = nth_field(cmd, ",", 2);
     if (!field) return limits.default_ms;
-    int ms = atoi(std::string(*field).c_str());
+    long ms = strtol(std::string(*field).c_str(), nullptr, 10);
     if (ms > limits.max_ms) return limits.max_ms;
-    return ms < 0 ? 0 : ms;
+    return ms < 0 ? 0 : static_cast<int>(ms);
 }
 
 struct FlashForm {

@@ -192,6 +192,7 @@ INSTANTIATE_TEST_SUITE_P(Timers, FlashPulse, ::testing::Values(
     Pulse{"AT+FLAMP=1,1", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 500, "OK", "RearDefault"},
     Pulse{"AT+FLAMP=1,1,100", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 100, "OK", "RearGiven"},
     Pulse{"AT+FLAMP=1,1,2000", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 500, "OK", "RearCapped"},
+    Pulse{"AT+FLAMP=1,1,99999999999", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 500, "OK", "RearHugeCapped"},
     Pulse{"AT+FLAMP=1,1,-40", "EXT_REAR_FLASH_LED1 900", "EXT_REAR_FLASH_LED1 0", 0, "OK", "RearNegativeClosesAtOnce"},
     Pulse{"AT+FLAMP=2,1", "EXT_REAR_FLASH_LED2 900", "EXT_REAR_FLASH_LED2 0", 500, "ATOK", "SecondDefault"},
     Pulse{"AT+FLAMP=2,1,2000", "EXT_REAR_FLASH_LED2 900", "EXT_REAR_FLASH_LED2 0", 500, "ATOK", "SecondCapped"},

@@ -15,6 +15,12 @@ const char *kPdaf = "/data/engineermode/pdaf_test";
 const char *kRefocus = "/data/engineermode/refocus_check";
 const char *kFrontRefocus = "/data/engineermode/front_refocus_check";
 const std::string kFocus = "eng_AT_camera#NULL#NULL#focus_control#distance ";
+std::string repeat(const std::string &s, int n) {
+    std::string out;
+    while (n-- > 0) out += s;
+    return out;
+}
+const std::string kManyParams = repeat(",77", 600);
 const std::string kBackStart = "camera start#cameraId back#eng_AT_command true -> success";
 
 std::string nv_pattern() {  // every byte non-zero, so a stray write shows
@@ -206,6 +212,9 @@ INSTANTIATE_TEST_SUITE_P(SelfTest, CameraLine, ::testing::Values(
          "\r\n\"+flag:\"\r\n\r\n\"+k:v w\"\r\n", "ATOK", {}, {}, {}, "KeyWithoutValue"},
     Case{"AT+QX_CCM_SLTS=3,rear,main,0", all_fail, "fail#busy", "ERROR", {}, {}, {}, "CameraFails"},
     Case{"AT+QX_CCM_SLTS=1,rear,main,1", gated, "", "ATOK", {}, {}, {}, "NotGated"},
+    // The message is cut where its 1024-byte buffer ends.
+    Case{"AT+QX_CCM_SLTS=2,rear,main,0" + kManyParams, nullptr, "", "ATOK",
+         {"camera eng_AT_camera#rear#main#auto_test_set_param#params 0" + kManyParams.substr(0, 1023 - 52) + " -> "}},
     Case{"AT+QX_CCM_SLTS=1", nullptr, "", "ERROR", {}, {"camera"}},
     Case{"AT+QX_CCM_SLTS=1,rear,main", nullptr, "", "ERROR", {}, {"camera"}},
     Case{"AT+QX_CCM_SLTS=4,rear,main,1", nullptr, "", "ERROR", {}, {"camera"}}), case_name);
