@@ -100,7 +100,6 @@ INSTANTIATE_TEST_SUITE_P(Torch, FlashLine, ::testing::Values(
     Case{"AT+QXSG=1", both_names, "", "OK", {{kLed1, "75"}, {kLed, "5\n"}}, {}, "PrefersLed1"},
     Case{"AT+QXSG=1", [](const Sandbox &b) { remove_node(b, kLed1); }, "", "ERROR", {{kLed, kGone}}, {}, "NoRearFlash"},
     Case{"AT+QXSG=0", lit, "", "OK", {{kLed1, "0"}, {kLed2, "75"}, {kFront, "75"}}},
-    Case{"AT+QXSG=0,1", lit, "", "OK", {{kLed1, "0"}}},
     Case{"AT+QXSG=2", nullptr, "", "ATOK", {{kLed2, "75"}, {kLed1, "0\n"}}},
     Case{"AT+QXSG=0,2", lit, "", "ATOK", {{kLed2, "0"}, {kLed1, "75"}}},
     Case{"AT+QXSG=2", [](const Sandbox &b) { remove_node(b, kLed2); }, "", "ATNG", {{kLed2, kGone}}, {}, "NoSecondFlash"},
@@ -198,7 +197,6 @@ INSTANTIATE_TEST_SUITE_P(Timers, FlashPulse, ::testing::Values(
     Pulse{"AT+FLAMP=2,1,2000", "EXT_REAR_FLASH_LED2 900", "EXT_REAR_FLASH_LED2 0", 500, "ATOK", "SecondCapped"},
     // The front torch stays on; its timer closes the rear main flash.
     Pulse{"AT+FLAMP=0,1", "EXT_FRONT_FLASH_LED 75", "EXT_REAR_FLASH_LED1 0", 200, "OK", "FrontTorchDefault"},
-    Pulse{"AT+FLAMP=0,1,700", "EXT_FRONT_FLASH_LED 75", "EXT_REAR_FLASH_LED1 0", 700, "OK", "FrontTorchGiven"},
     Pulse{"AT+QX_FLED_INF=3,1", "EXT_FRONT_FLASH_LED 75", "EXT_FRONT_FLASH_LED 0", 3000, "ATOK", "InfraredThreeSeconds"}),
     [](const ::testing::TestParamInfo<Pulse> &info) { return std::string(info.param.name); });
 
