@@ -1,5 +1,12 @@
 // The camera service and camera helpers of the factory library on the simulated phone.
-// Replies come from .sim/camera.replies, fitted cameras and serial numbers from config.
+// On a phone the camera HAL service takes "#"-separated messages from the factory library,
+// opens, captures, focuses and tests the named module, and answers with a text that holds
+// "success" when it worked; the library also reads module serial numbers and OTP status
+// and translates the newer AT camera commands. The model answers each message from the
+// reply script .sim/camera.replies (the fault "camera" fails every message), and takes the
+// fitted cameras, serial numbers and calibration items from .sim/config. It leaves out
+// the cameras themselves: nothing is opened or captured, a reply comes at once, and no
+// state carries from one message to the next unless the script says so.
 #include <errno.h>
 #include <fcntl.h>
 
@@ -55,6 +62,7 @@ int transform_at_cmd_to_camera_info(const char *command, char *msg, int msg_len,
     if (eq == std::string::npos || c.compare(0, 3, "AT+") != 0 || sim::fault("camera-transform")) return -1;
     std::string name = c.substr(3, eq - 3), args = c.substr(eq + 1), m = "eng_AT_camera#";
     for (char ch : name) m += static_cast<char>(tolower(static_cast<unsigned char>(ch)));
+    m += '#';
     for (char ch : args) m += ch == ',' ? '#' : ch;
     put(msg, msg_len, m);
     std::string upper;

@@ -28,12 +28,14 @@ namespace sim {
 // The device models, one file each. A new model adds its line here.
 extern const DeviceModel kInputEventModel;
 extern const DeviceModel kSideKeyModel;
+extern const DeviceModel kFlashLedModel;
 
 namespace {
 
 const DeviceModel *const kModels[] = {
     &kInputEventModel,
     &kSideKeyModel,
+    &kFlashLedModel,
 };
 
 struct Session {

@@ -246,9 +246,11 @@ int is_calibrate_item_support(const char *item) {
     return items.find("," + opt(item) + ",") != std::string::npos;
 }
 
+// The fault "calibrate-item" makes the item store refuse the state (an I/O error).
 int set_calibrate_item_state(const char *item, const char *state, int uart_flag) {
-    sim::record("calibrate", opt(item) + "=" + opt(state) + " uart=" + std::to_string(uart_flag));
-    return 0;
+    bool failed = sim::fault("calibrate-item");
+    sim::record("calibrate", opt(item) + "=" + opt(state) + " uart=" + std::to_string(uart_flag) + (failed ? " (failed)" : ""));
+    return failed ? -EIO : 0;
 }
 
 // ---- logging, reset and end-of-line operations
