@@ -83,7 +83,13 @@ protected:
         is_sp = saved_sp;
         InProcess::TearDown();
     }
+    // The controller's record once every open has been closed (the device thread records
+    // the close a moment after the daemon's close).
     Lines record(bool answers = false) const {
+        all_closed();
+        return raw_record(answers);
+    }
+    Lines raw_record(bool answers = false) const {
         Lines out;
         for (const auto &e : box.event_list())
             if (e.kind == "nfc" && e.detail.rfind("getCPLC", 0) != 0 && (answers || e.detail.rfind("out ", 0) != 0))
@@ -99,7 +105,7 @@ protected:
     // A worker left running holds its open until it ends: wait (bounded) until it has.
     bool all_closed(int ms = 5000) const {
         for (int waited = 0;; waited += 20) {
-            Lines r = record();
+            Lines r = raw_record();
             if (std::count(r.begin(), r.end(), "open") == std::count(r.begin(), r.end(), "close")) return true;
             if (waited >= ms) return false;
             std::this_thread::sleep_for(std::chrono::milliseconds(20));
