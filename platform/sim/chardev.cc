@@ -29,6 +29,7 @@ namespace sim {
 extern const DeviceModel kInputEventModel;
 extern const DeviceModel kSideKeyModel;
 extern const DeviceModel kFlashLedModel;
+extern const DeviceModel kNfcControllerModel;
 
 namespace {
 
@@ -36,6 +37,7 @@ const DeviceModel *const kModels[] = {
     &kInputEventModel,
     &kSideKeyModel,
     &kFlashLedModel,
+    &kNfcControllerModel,
 };
 
 struct Session {
