@@ -209,6 +209,10 @@ bool gps_request(int option, char *reply) {
 
 void *update_gps_value_thread(void *arg) {
     const unsigned generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
+    // Nobody joins a stream worker: detached, its stack goes back when it ends instead of
+    // piling up with every AT+QXGPS=2 of a long shift.
+    pthread_detach(pthread_self());
+    LOGI("Start");
     wait_for_current_answer();
     while (g_gps_streaming && g_gps_generation == generation) {
         char reply[kGpsReplySize] = {};
@@ -220,6 +224,7 @@ void *update_gps_value_thread(void *arg) {
         }
         std::this_thread::sleep_for(kGpsPeriod);
     }
+    LOGI("Exit");
     return nullptr;
 }
 
