@@ -73,3 +73,8 @@ std::vector<std::string_view> comma_fields(std::string_view line) {
     }
     return fields;
 }
+
+std::string_view without_line_end(std::string_view field) {
+    size_t end = field.find_last_not_of("\r\n ");
+    return end == std::string_view::npos ? std::string_view{} : field.substr(0, end + 1);
+}

@@ -38,3 +38,7 @@ bool read_node(const char *path, char *buf, size_t size);
 // The non-empty comma-separated fields of a line, as a tokeniser sees them: "1,,0" has
 // two fields, and the first field is the command with its "=" part.
 std::vector<std::string_view> comma_fields(std::string_view line);
+
+// A field at the end of the line without the station's line end: a TCP line keeps its CR
+// LF (and blanks) all the way to the handler.
+std::string_view without_line_end(std::string_view field);

@@ -122,6 +122,8 @@ INSTANTIATE_TEST_SUITE_P(Bluetooth, Connectivity, ::testing::Values(
     Case{"EnterTestModeByPrefix", "AT+EMBT=10", nullptr, "", "OK", {"shell /system/bin/bdt entrydut 2>&1\n"}},
     Case{"TransmitContinuous", "AT+EMBT=1,2402 7", nullptr, "", "OK", {"shell /system/bin/bdt txcontinuous 2402 7 2>&1\n"}},
     Case{"TransmitRefusesShellText", "AT+EMBT=1,5;reboot", nullptr, "", "ERROR", {}, "bdt"},
+    // A TCP station's line end stays in the line; it is not part of the argument.
+    Case{"TransmitTcpLineEnd", "AT+EMBT=1,2402 7\r\n", nullptr, "", "OK", {"shell /system/bin/bdt txcontinuous 2402 7 2>&1\n"}},
     Case{"LeaveTestModeStartsCnss", "AT+EMBT=2", nullptr, "", "OK",
          {"shell /system/bin/sh -c \"/system/bin/bdt exitdut\"\n", "shell /system/bin/sh -c \"start cnss-daemon\"\n"}},
     Case{"LeaveTestModeCnssRunning", "AT+EMBT=2", cnss_running, "", "OK", {"bdt exitdut"}, "start cnss"},
@@ -151,6 +153,10 @@ INSTANTIATE_TEST_SUITE_P(WlanMac, Connectivity, ::testing::Values(
     Case{"WriteUnclosedQuote", "AT+QXWMAC=1,\"FFAABBCCDDEE", nullptr, "", "ERROR", {}, "chown"},
     Case{"WriteNotHex", "AT+QXWMAC=1,G0AABBCCDDEE", nullptr, "", "ERROR", {}, "chown"},
     Case{"WriteMissing", "AT+QXWMAC=1", nullptr, "", "ERROR", {}, "chown"},
+    Case{"WriteTcpLineEnd", "AT+QXWMAC=1,02AABBCCDDEE\r\n", nullptr, "", "OK", {}, nullptr,
+         {{kMac, mac_lines("02AABBCCDDEE", "04AABBCCDDEE")}}},
+    // A quoted address must end in its quote, and a TCP line end comes after it.
+    Case{"WriteQuotedTcpLineEnd", "AT+QXWMAC=1,\"02AABBCCDDEE\"\r\n", nullptr, "", "ERROR", {}, "chown"},
     Case{"WriteLineBreakRefused", "AT+QXWMAC=1,00A0C6\tIntf9", nullptr, "", "ERROR", {}, "chown"},
     Case{"WriteChownRefused", "AT+QXWMAC=1,02AABBCCDDEE", no_chown, "\"Operation not permitted\"", "ERROR",
          {"shell chmod 0664 /persist/wlan_mac.bin"}, nullptr, {{kMac, mac_lines("02AABBCCDDEE", "04AABBCCDDEE")}}},
