@@ -99,3 +99,8 @@ bool file_item_ok(const char *text, bool is_key) {
     if (is_key && (text[0] == '\0' || strchr(text, '=') != nullptr)) return false;
     return strpbrk(text, "\r\n") == nullptr;
 }
+
+std::string_view without_line_end(std::string_view field) {
+    size_t end = field.find_last_not_of("\r\n ");
+    return end == std::string_view::npos ? std::string_view{} : field.substr(0, end + 1);
+}

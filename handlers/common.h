@@ -49,3 +49,7 @@ bool leading_number(const char *text, long long min, long long max, long long *o
 // no line ends (which would add lines, and with them keys), and for a key also not empty
 // and no "=" (which would move the split between key and value).
 bool file_item_ok(const char *text, bool is_key);
+
+// A field at the end of the line without the station's line end: a TCP line keeps its CR
+// LF (and blanks) all the way to the handler.
+std::string_view without_line_end(std::string_view field);

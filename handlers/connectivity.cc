@@ -153,8 +153,9 @@ int enter_bt_test_mode(const char *cmd) {
     std::vector<std::string_view> f = comma_fields(cmd);
     char command[kShellOutputSize];
     if (f.size() >= 2) {
-        if (!safe_shell_argument(f[1])) return invalid_command(cmd);
-        snprintf(command, sizeof command, "/system/bin/bdt txcontinuous %.*s 2>&1", static_cast<int>(f[1].size()), f[1].data());
+        std::string_view args = without_line_end(f[1]);
+        if (!safe_shell_argument(args)) return invalid_command(cmd);
+        snprintf(command, sizeof command, "/system/bin/bdt txcontinuous %.*s 2>&1", static_cast<int>(args.size()), args.data());
     } else {
         snprintf(command, sizeof command, "/system/bin/bdt entrydut 2>&1");
     }
@@ -209,6 +210,10 @@ bool gps_request(int option, char *reply) {
 
 void *update_gps_value_thread(void *arg) {
     const unsigned generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
+    // Nobody joins a stream worker: detached, its stack goes back when it ends instead of
+    // piling up with every AT+QXGPS=2 of a long shift.
+    pthread_detach(pthread_self());
+    LOGI("Start");
     wait_for_current_answer();
     while (g_gps_streaming && g_gps_generation == generation) {
         char reply[kGpsReplySize] = {};
@@ -220,6 +225,7 @@ void *update_gps_value_thread(void *arg) {
         }
         std::this_thread::sleep_for(kGpsPeriod);
     }
+    LOGI("Exit");
     return nullptr;
 }
 
@@ -345,7 +351,7 @@ int write_wlan_mac(const char *cmd, char *resp) {
         LOGE("wrong format MAC:%s", field.c_str());
         return RC_ERROR;
     }
-    mac.resize(strlen(mac.c_str()));
+    mac.resize(without_line_end(mac.c_str()).size());
     // The file is read line by line: a line break in the address would add an interface.
     bool control = std::any_of(mac.begin(), mac.end(), [](char c) { return static_cast<unsigned char>(c) < 0x20; });
     std::string second = mac;

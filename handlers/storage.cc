@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <string>
 #include <string_view>
 #include <thread>
 #include <vector>
@@ -202,7 +203,8 @@ int otg_state(char *resp) {
 int otg_device_start(char *cmd, char *resp) {
     const char *comma = strchr(cmd, ',');
     int seconds = 0;
-    if (comma == nullptr || !android::base::ParseInt(comma + 1, &seconds, 1, kOtgSecondsMax)) {
+    // Range-checked parsing: a huge count must not wrap round into the range.
+    if (comma == nullptr || !android::base::ParseInt(std::string(without_line_end(comma + 1)), &seconds, 1, kOtgSecondsMax)) {
         quote_reason(resp, "para error");
         return RC_ATNG;
     }

@@ -97,6 +97,11 @@ void mac_fallback(const Sandbox &b) {
 void no_mac(const Sandbox &b) { std::filesystem::remove(b.path(kMac)); }
 void mac_without_eq(const Sandbox &b) { b.write(kMac, "garbage\n"); }
 void no_chown(const Sandbox &b) { b.fault("chown"); }
+void persist_gone(const Sandbox &b) { std::filesystem::remove_all(b.path("/persist")); }
+void both_persists_gone(const Sandbox &b) {
+    persist_gone(b);
+    std::filesystem::remove_all(b.path("/mnt/vendor/persist"));
+}
 
 const std::string kBtNvDefault("\1\0\6\x55\x44\x33\x22\x11\x00", 9);
 
@@ -117,6 +122,8 @@ INSTANTIATE_TEST_SUITE_P(Bluetooth, Connectivity, ::testing::Values(
     Case{"EnterTestModeByPrefix", "AT+EMBT=10", nullptr, "", "OK", {"shell /system/bin/bdt entrydut 2>&1\n"}},
     Case{"TransmitContinuous", "AT+EMBT=1,2402 7", nullptr, "", "OK", {"shell /system/bin/bdt txcontinuous 2402 7 2>&1\n"}},
     Case{"TransmitRefusesShellText", "AT+EMBT=1,5;reboot", nullptr, "", "ERROR", {}, "bdt"},
+    // A TCP station's line end stays in the line; it is not part of the argument.
+    Case{"TransmitTcpLineEnd", "AT+EMBT=1,2402 7\r\n", nullptr, "", "OK", {"shell /system/bin/bdt txcontinuous 2402 7 2>&1\n"}},
     Case{"LeaveTestModeStartsCnss", "AT+EMBT=2", nullptr, "", "OK",
          {"shell /system/bin/sh -c \"/system/bin/bdt exitdut\"\n", "shell /system/bin/sh -c \"start cnss-daemon\"\n"}},
     Case{"LeaveTestModeCnssRunning", "AT+EMBT=2", cnss_running, "", "OK", {"bdt exitdut"}, "start cnss"},
@@ -146,9 +153,18 @@ INSTANTIATE_TEST_SUITE_P(WlanMac, Connectivity, ::testing::Values(
     Case{"WriteUnclosedQuote", "AT+QXWMAC=1,\"FFAABBCCDDEE", nullptr, "", "ERROR", {}, "chown"},
     Case{"WriteNotHex", "AT+QXWMAC=1,G0AABBCCDDEE", nullptr, "", "ERROR", {}, "chown"},
     Case{"WriteMissing", "AT+QXWMAC=1", nullptr, "", "ERROR", {}, "chown"},
+    Case{"WriteTcpLineEnd", "AT+QXWMAC=1,02AABBCCDDEE\r\n", nullptr, "", "OK", {}, nullptr,
+         {{kMac, mac_lines("02AABBCCDDEE", "04AABBCCDDEE")}}},
+    // A quoted address must end in its quote, and a TCP line end comes after it.
+    Case{"WriteQuotedTcpLineEnd", "AT+QXWMAC=1,\"02AABBCCDDEE\"\r\n", nullptr, "", "ERROR", {}, "chown"},
     Case{"WriteLineBreakRefused", "AT+QXWMAC=1,00A0C6\tIntf9", nullptr, "", "ERROR", {}, "chown"},
     Case{"WriteChownRefused", "AT+QXWMAC=1,02AABBCCDDEE", no_chown, "\"Operation not permitted\"", "ERROR",
          {"shell chmod 0664 /persist/wlan_mac.bin"}, nullptr, {{kMac, mac_lines("02AABBCCDDEE", "04AABBCCDDEE")}}},
+    // The fall-back file gets the owner and the mode, not the one that could not be made.
+    Case{"WriteFallback", "AT+QXWMAC=1,02AABBCCDDEE", persist_gone, "", "OK",
+         {"chown /mnt/vendor/persist/wlan_mac.bin 1000:1000", "shell chmod 0664 /mnt/vendor/persist/wlan_mac.bin\n"},
+         "chown /persist", {{kMacFallback, mac_lines("02AABBCCDDEE", "04AABBCCDDEE")}}},
+    Case{"WriteNowhere", "AT+QXWMAC=1,02AABBCCDDEE", both_persists_gone, "", "ERROR", {}, "chmod"},
     Case{"Unknown", "AT+QXWMAC=2", nullptr, "", "ERROR"}), case_name);
 
 TEST_F(Wireless, UnclosedQuoteLeavesTheFileAlone) {
@@ -232,6 +248,38 @@ TEST_F(Wireless, GpsFailedCloseKeepsTheEngineOpen) {
     box.write("/.sim/events.log", "");
     EXPECT_EQ(serve("AT+QXGPS=1"), frame("AT+QXGPS=1", "", "OK"));
     EXPECT_EQ(box.events().find("gps option 1"), std::string::npos);  // still open
+}
+
+// A worker that ended on a failed request stays recorded: AT+QXGPS=2 answers OK without a
+// new worker until AT+QXGPS=0 has cleared it; after that a stream starts again.
+TEST_F(Wireless, GpsWorkerEndedByAFailureStaysRecordedUntilClosed) {
+    is_sp = 1;
+    auto served = [&](const std::string &line) {  // the answer only, not the values that follow it
+        const std::string want = frame(line, "", "OK");
+        return serve(line, SRC_TCP, want.size()) == want;
+    };
+    auto reads = [&] {
+        std::vector<std::string> r = gps_records(box.events());
+        return std::count_if(r.begin(), r.end(), [](const std::string &l) { return l.rfind("gps option 2", 0) == 0; });
+    };
+    auto wait_reads = [&](long n) {
+        for (int i = 0; i < 100 && reads() < n; ++i) std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        return reads();
+    };
+    EXPECT_TRUE(served("AT+QXGPS=1"));
+    box.fault("gps");
+    box.write("/.sim/events.log", "");
+    EXPECT_TRUE(served("AT+QXGPS=2"));
+    ASSERT_EQ(wait_reads(1), 1);
+    EXPECT_EQ(gps_records(box.events()), std::vector<std::string>{"gps option 2 (failed)"});
+    box.write("/.sim/faults", "");
+    EXPECT_TRUE(served("AT+QXGPS=2"));
+    std::this_thread::sleep_for(std::chrono::milliseconds(400));  // a new worker would have read by now
+    EXPECT_EQ(reads(), 1) << box.events();
+    EXPECT_TRUE(served("AT+QXGPS=0"));
+    EXPECT_TRUE(served("AT+QXGPS=1"));
+    EXPECT_TRUE(served("AT+QXGPS=2"));
+    EXPECT_GE(wait_reads(2), 2) << box.events();
 }
 
 }  // namespace

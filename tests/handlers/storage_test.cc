@@ -256,6 +256,8 @@ INSTANTIATE_TEST_SUITE_P(Otg, StorageLine, ::testing::Values(
     Case{"Zero", "AT+QX_OTG_DEV=1,0", nullptr, "\"para error\"", "ATNG", {}, "message"},
     Case{"TooLong", "AT+QX_OTG_DEV=1,601", nullptr, "\"para error\"", "ATNG", {}, "message"},
     Case{"NotANumber", "AT+QX_OTG_DEV=1,5s", nullptr, "\"para error\"", "ATNG", {}, "message"},
+    // Over TCP the station's line end stays in the line; it does not spoil the seconds.
+    Case{"TcpLineEnd", "AT+QX_OTG_DEV=1,1\r\n", nullptr, "", "ATOK", {"message otg_test enable -> ok"}},
     Case{"Huge", "AT+QX_OTG_DEV=1,4294967297", nullptr, "\"para error\"", "ATNG", {}, "message"},
     Case{"Refused", "AT+QX_OTG_DEV=1,600", refuse, "\"open otg error\"", "ATNG", {"message otg_test enable -> error"},
          "setprop"},
