@@ -19,6 +19,11 @@ constexpr size_t kUpdateFlag = 392;       // bit 0 delayed reset, bit 5 factory 
 constexpr size_t kAssemblyAtMode = 488;
 constexpr size_t kDefaultAtMode = 664;    // one character
 constexpr size_t kFirstBootDone = 688;
+constexpr size_t kWallpaperId = 88;         // AT+QXMMIUI
+constexpr size_t kSpecialProduct = 328;     // bit set; kSecondScreenOff: AT+SECSCREEN
+constexpr uint32_t kSecondScreenOff = 0x40;
+constexpr size_t kMainPanelColour = 516;    // calibrated colour 0xRRGGBB, restored by AT+LCMT=1
+constexpr size_t kBackPanelColour = 520;    // the same for the back panel, AT+LCMT_BACK=1
 
 struct Record {
     unsigned char bytes[PYXA_NV_SIZE] = {};
