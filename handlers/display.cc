@@ -203,20 +203,22 @@ int write_rgb_to_tp(int colour, int panel) {
     char text[16];
     snprintf(text, sizeof text, "%d", colour);
     kaelatcmd_set_system_property(p.cali_property, text);
-    // The panel node takes each write whole. Truncating changes nothing for the driver and
-    // keeps a node that is a plain file reading back exactly the value written.
-    unique_fd fd(dev::open(p.calidata, O_RDWR | O_TRUNC));
+    unique_fd fd(dev::open(p.calidata, O_RDWR));
     if (fd.get() < 0) {
         LOGE("open %s failed: %s", p.calidata, strerror(errno));
         return -1;
     }
     int len = snprintf(text, sizeof text, "%u", static_cast<uint32_t>(colour) | kCalibrationMark);
     ssize_t n = ::write(fd.get(), text, static_cast<size_t>(len));
-    fsync(fd.get());
     if (n != len) {
         LOGE("write %s to %s failed: %zd", text, p.calidata, n);
         return -1;
     }
+    // The panel driver takes each write whole; a node that is a plain file would keep the
+    // tail of a longer old text. Cut only after a full write, so a failed one leaves the
+    // node as it was (a sysfs node ignores the cut).
+    if (ftruncate(fd.get(), len) != 0) LOGD("%s keeps its length: %s", p.calidata, strerror(errno));
+    fsync(fd.get());
     return 0;
 }
 

@@ -46,7 +46,8 @@ struct Case {
     Pairs replies = {};  // test-app script lines of this case
     Pairs files = {};    // node texts before the line
     std::vector<std::string> remove = {};
-    Fields nv = {};  // NV fields before the line
+    Pairs config = {};  // simulated hardware settings
+    Fields nv = {};     // NV fields before the line
     std::string body = "";
     std::string word = "OK";
     std::string events = "";  // the whole record of device effects, in order
@@ -89,6 +90,7 @@ TEST_P(DisplayLine, Answers) {
     box.write("/.sim/nv.bin", nv_record(c.nv));
     for (const auto &[path, text] : c.files) box.write(path, text);
     for (const auto &path : c.remove) std::filesystem::remove_all(box.path(path));
+    for (const auto &[key, value] : c.config) sim::write_kv(box.path("/.sim/config"), key, &value);
     if (c.fault) box.fault(c.fault);
     for (const auto &[message, reply] : c.replies) box.reply(message, reply);
 
@@ -269,6 +271,8 @@ INSTANTIATE_TEST_SUITE_P(Touch, DisplayLine, ::testing::Values(
     Case{.line = "AT+QXTOUCH=3", .tag = "NoVerdict", .word = "ERROR"},
     Case{.line = "AT+QXTOUCH_BACK=3", .back = true, .files = {{kCaliFile + "_back", "Pass"}}},
     Case{.line = "AT+QXTOUCH=3,5", .events = "touchpanel sensor_test count=5 item=165 -> 0\n", .nodes = {{kCaliFile, "Pass\n"}}},
+    Case{.line = "AT+QXTOUCH=3,5", .tag = "ItemFails", .config = {{"touchpanel_test.165", "2"}}, .word = "ERROR",
+         .events = "touchpanel sensor_test count=5 item=165 -> 2\n", .nodes = {{kCaliFile, "Fail\n"}}},
     Case{.line = "AT+QXTOUCH_BACK=3,5", .back = true, .events = "touchpanel sensor_test count=5 item=167 -> 0\n"},
     Case{.line = "AT+QXTOUCH=3,", .word = "ERROR"},
     Case{.line = "AT+QXTOUCH=WE,0", .body = "\"1\""},
