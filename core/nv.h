@@ -19,6 +19,7 @@ constexpr size_t kUpdateFlag = 392;       // bit 0 delayed reset, bit 5 factory 
 constexpr size_t kAssemblyAtMode = 488;
 constexpr size_t kDefaultAtMode = 664;    // one character
 constexpr size_t kFirstBootDone = 688;
+constexpr size_t kDpdtService = 104;      // 1 asks the DPDT service to run; the debug-port close clears it
 constexpr size_t kWallpaperId = 88;         // AT+QXMMIUI
 constexpr size_t kSpecialProduct = 328;     // bit set; kSecondScreenOff: AT+SECSCREEN
 constexpr uint32_t kSecondScreenOff = 0x40;
