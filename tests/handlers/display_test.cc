@@ -367,6 +367,48 @@ TEST_F(DisplayTest, RestoreHappensOnce) {
     EXPECT_EQ(box.events(), "setprop ro.sys.mainlcm.cali=14145496\n" + kLcm + "-e lcm_color W\n" + kLcm + "-e lcm_color R\n");
 }
 
+// A station polls a running test: each query sees the next state, and a screenless panel
+// is never asked through the test app.
+struct PollCase {
+    std::string name, line, what;
+    std::vector<std::string> values, bodies;
+    const char *key = nullptr;  // a factory key making the main panel screenless
+    std::vector<std::string> words = {};  // per answer; OK when empty
+};
+void PrintTo(const PollCase &c, std::ostream *os) { *os << c.name; }
+class DisplayPoll : public DisplayTest, public ::testing::WithParamInterface<PollCase> {};
+
+TEST_P(DisplayPoll, EachQuerySeesTheNextState) {
+    const PollCase &c = GetParam();
+    if (c.key) box.write(kKeyFile, c.key);
+    box.sequence(c.what, c.values);
+    for (size_t i = 0; i < c.bodies.size(); ++i) {
+        const std::string word = c.words.empty() ? "OK" : c.words[i];
+        const std::string frame = c.line + "\r\n" + c.bodies[i] + "\r\n" + word + "\r\n";
+        EXPECT_EQ(serve(c.line, SRC_TCP, frame.size()), frame) << "query " << i;
+    }
+    if (c.key) {
+        EXPECT_EQ(box.events().find("message"), std::string::npos) << box.events();
+    }
+}
+
+const std::string kTouchQuery = "touchscreen_selfcheck 0,display_id:0";
+const std::string kTs = "\r\n\"touchscreen:";
+
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(Sequences, DisplayPoll, ::testing::Values(
+    PollCase{"TouchTestApp", "AT+QXTOUCH=0", "testapp:" + kTouchQuery, {"testing", "testing", "ok"},
+             {kTs + "2\"\r\n", kTs + "2\"\r\n", kTs + "1\"\r\n", kTs + "1\"\r\n"}},
+    PollCase{"TouchScreenless", "AT+QXTOUCH=0", kTestFile, {"testing", "Fail"},
+             {kTs + "2\"\r\n", kTs + "0\"\r\n"}, kBadScreen},
+    PollCase{"WakeUp", "AT+QXWAKE=0", "testapp:wakeup 0 display_id:0", {"testing", "error", "", "ok"},
+             {"\r\n\"wake:2\"\r\n", "\r\n\"wake:0\"\r\n", "", "\r\n\"wake:1\"\r\n"}, nullptr,
+             {"OK", "OK", "ERROR", "OK"}},
+    PollCase{"SensorTestRetried", "AT+QXTOUCH=1,3", "config:touchpanel_test.166", {"1", "0"}, {"", ""}, kBadScreen,
+             {"ERROR", "OK"}}),
+    [](const ::testing::TestParamInfo<PollCase> &info) { return info.param.name; });
+// clang-format on
+
 // The real daemon in AT mode on a two-panel phone: the keep-awake forms over TCP and the
 // local socket answer as the handlers do in-process.
 TEST(DisplayDaemon, AtModeKeepAwakeOverTheTransports) {
