@@ -111,7 +111,6 @@ INSTANTIATE_TEST_SUITE_P(Colours, DisplayLine, ::testing::Values(
     Case{.line = "AT+LCMT=1,R,G", .events = kLcm + "-e lcm_color R\n"},
     Case{.line = "AT+LCMT=1," + kLongArg + kLongArg, .tag = "Long", .events = kLcm + "-e lcm_color " + (kLongArg + kLongArg).substr(0, 86) + "\n"},
     Case{.line = "AT+LCMT=1", .word = "ERROR"},
-    Case{.line = "AT+LCMT=1,", .word = "ERROR"},
     Case{.line = "AT+LCMT=1,W", .tag = "Calibrated", .back = true, .events = kLcm + "-e lcm_color W\n",
          .nodes = {{kMainCali, "0xD7 0xD7 0xD8\n"}}},
     Case{.line = "AT+LCMT=1,W", .tag = "LowestColourRestored", .back = true, .files = {{kMainCali, kLost}},
@@ -274,7 +273,6 @@ INSTANTIATE_TEST_SUITE_P(Touch, DisplayLine, ::testing::Values(
     Case{.line = "AT+QXTOUCH=3,5", .tag = "ItemFails", .config = {{"touchpanel_test.165", "2"}}, .word = "ERROR",
          .events = "touchpanel sensor_test count=5 item=165 -> 2\n", .nodes = {{kCaliFile, "Fail\n"}}},
     Case{.line = "AT+QXTOUCH_BACK=3,5", .back = true, .events = "touchpanel sensor_test count=5 item=167 -> 0\n"},
-    Case{.line = "AT+QXTOUCH=3,", .word = "ERROR"},
     Case{.line = "AT+QXTOUCH=WE,0", .body = "\"1\""},
     Case{.line = "AT+QXTOUCH=WE,0", .tag = "Edge", .files = {{"/sys/touch/wafer_edge", "255\n"}}, .body = "\"0\""},
     Case{.line = "AT+QXTOUCH=WE,0", .tag = "Missing", .remove = {"/sys/touch"}, .body = "\"0\""},
@@ -321,7 +319,6 @@ INSTANTIATE_TEST_SUITE_P(PanelData, DisplayLine, ::testing::Values(
     Case{.line = "AT+SECSCREEN=3", .body = "invalid command: AT+SECSCREEN=3", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=1,42", .events = "nv write\n", .nv_after = {{nv::kWallpaperId, 42}}},
     Case{.line = "AT+QXMMIUI=1,4a", .word = "ERROR"},
-    Case{.line = "AT+QXMMIUI=1,-4", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=1,99999999999", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=1", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=1,42", .tag = "NvWriteFails", .fault = "nv-write", .word = "ERROR"},
@@ -343,18 +340,6 @@ TEST_F(DisplayTest, BacklightFormsAndCase) {
     EXPECT_EQ(mmi_backlight_test_handler(back, 36, resp), RC_OK);
     EXPECT_EQ(box.events(), msg("backlight 1 display_id:0") + msg("backlight 1 display_id:0") +
                                 msg("backlight 0 display_id:4096"));
-}
-
-// The lights family holds and lets go of the back panel through this handler.
-TEST_F(DisplayTest, KeepAwakeHoldsAndReleasesTheLock) {
-    two_panels();
-    char resp[kRespSize] = {0};
-    char hold[] = "AT+QXSP_BACK=0", release[] = "AT+QXSP_BACK=1";
-    EXPECT_EQ(keep_screen_on_handler(hold, 36, resp), RC_OK);
-    EXPECT_EQ(keep_screen_on_handler(release, 36, resp), RC_OK);
-    EXPECT_STREQ(resp, "");
-    EXPECT_EQ(box.events(), kWake + msg("keep_screen_on 1,display_id:4096") + "wakelock release ftcmd\n" +
-                                msg("keep_screen_on 0,display_id:4096"));
 }
 
 // A restored panel reads as calibrated: the next colour is shown without a second restore.
