@@ -27,11 +27,13 @@ namespace sim {
 
 // The device models, one file each. A new model adds its line here.
 extern const DeviceModel kInputEventModel;
+extern const DeviceModel kLcmPanelModel;
 
 namespace {
 
 const DeviceModel *const kModels[] = {
     &kInputEventModel,
+    &kLcmPanelModel,
 };
 
 struct Session {
