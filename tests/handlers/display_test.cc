@@ -11,6 +11,7 @@
 
 #include "core/command_tables/handlers.h"
 #include "core/nv.h"
+#include "platform/device.h"
 #include "platform/sim/sim.h"
 #include "tests/support/daemon.h"
 #include "tests/support/in_process.h"
@@ -415,6 +416,30 @@ INSTANTIATE_TEST_SUITE_P(Sequences, DisplayPoll, ::testing::Values(
              {"ERROR", "OK"}}),
     [](const ::testing::TestParamInfo<PollCase> &info) { return info.param.name; });
 // clang-format on
+
+// The panel model takes only what its driver would: decimal 0x58RRGGBB, one line end
+// allowed; anything else leaves a lost calibration lost.
+struct PanelWrite {
+    std::string name, text, event, node;
+};
+void PrintTo(const PanelWrite &w, std::ostream *os) { *os << w.name; }
+class PanelModel : public DisplayTest, public ::testing::WithParamInterface<PanelWrite> {};
+
+TEST_P(PanelModel, TakesOnlyCalibrationValues) {
+    const PanelWrite &w = GetParam();
+    box.write(kMainCali, kLost);
+    ASSERT_EQ(dev::write_node(kMainCali, w.text.c_str()), static_cast<int>(w.text.size()));
+    EXPECT_EQ(box.events(), "panel main calibrate " + w.event + "\n");
+    EXPECT_EQ(box.read(kMainCali), w.node);
+}
+
+INSTANTIATE_TEST_SUITE_P(Writes, PanelModel, ::testing::Values(
+    PanelWrite{"Value", "1491132640", "1491132640", "0xE0 0xE0 0xE0\n"},
+    PanelWrite{"LineEnd", "1491132640\n", "1491132640|", "0xE0 0xE0 0xE0\n"},
+    PanelWrite{"NoMarker", "14737632", "14737632 -> rejected", kLost},
+    PanelWrite{"Word", "white", "white -> rejected", kLost},
+    PanelWrite{"TooLong", "99999999999", "99999999999 -> rejected", kLost}),
+    [](const ::testing::TestParamInfo<PanelWrite> &info) { return info.param.name; });
 
 // The real daemon in AT mode on a two-panel phone: the keep-awake forms over TCP and the
 // local socket answer as the handlers do in-process.
