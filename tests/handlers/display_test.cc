@@ -3,9 +3,9 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdint>
 #include <cstring>
-#include <chrono>
 #include <filesystem>
 #include <thread>
 
@@ -448,25 +448,30 @@ TEST(DisplayDaemon, AtModeKeepAwakeOverTheTransports) {
     std::string items = "\"double_lcm_support\"";
     sim::write_kv(box.path("/.sim/config"), "calibrate_items", &items);
     Daemon d(box, "console-at=sendAT");
-    int tcp = d.connect_tcp();
-    ASSERT_GE(tcp, 0);
-    ASSERT_TRUE(d.wait_prop("sys.qrcode.view", "0"));
     auto exchange = [](int fd, const std::string &line, size_t want) {
         send(fd, line.data(), line.size(), MSG_NOSIGNAL);
         return read_some(fd, want);
     };
-    // A station sends its TCP lines bare: a line end would stay part of the line.
-    const std::string refused = "AT+QXBS_BACK=1\r\n\r\nAT mode not support\r\n\r\nATERROR\r\n";
-    EXPECT_EQ(exchange(tcp, "AT+QXBS_BACK=1", refused.size()), refused);
-    EXPECT_EQ(exchange(tcp, "AT+QXBS=1", 17), "AT+QXBS=1\r\n\r\nOK\r\n");
-    close(tcp);
-    EXPECT_EQ(box.read("/cache/recovery/last_test_info"), "keepscreen=yes\n");
-    int local = d.connect_local();
+    // The TCP station stays connected to the end: one that hangs up runs its hang-up
+    // command, whose answer goes to whichever source is current.
+    int tcp = d.connect_tcp();
+    ASSERT_GE(tcp, 0);
+    ASSERT_TRUE(d.wait_prop("sys.qrcode.view", "0"));
+    int local = -1;
+    for (int i = 0; i < 100 && (local = d.connect_local()) < 0; ++i)  // its listener starts last
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
     ASSERT_GE(local, 0);
     EXPECT_EQ(exchange(local, "AT+QXSP_BACK=0", 24), "AT+QXSP_BACK=0\r\n\r\nOK\r\n");
     close(local);
     EXPECT_EQ(box.read("/sys/lcm/oled_acl"), "0");
     EXPECT_NE(box.events().find(kWake + msg("keep_screen_on 1,display_id:4096")), std::string::npos) << box.events();
+
+    // A station sends its TCP lines bare: a line end would stay part of the line.
+    const std::string refused = "AT+QXBS_BACK=1\r\n\r\nAT mode not support\r\n\r\nATERROR\r\n";
+    EXPECT_EQ(exchange(tcp, "AT+QXBS_BACK=1", refused.size()), refused);
+    EXPECT_EQ(exchange(tcp, "AT+QXBS=1", 17), "AT+QXBS=1\r\n\r\nOK\r\n");
+    EXPECT_EQ(box.read("/cache/recovery/last_test_info"), "keepscreen=yes\n");
+    close(tcp);
 }
 
 }  // namespace
