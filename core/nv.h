@@ -24,6 +24,11 @@ constexpr size_t kGsensorCalFlag = 0;     // 1 after a good accelerometer calibr
 constexpr size_t kGsensorCalOffsets = 76; // accelerometer offsets x, y, z (three s32)
 constexpr size_t kGyroCalFlag = 120;      // 1 after a good gyroscope calibration
 constexpr size_t kGyroCalOffsets = 124;   // gyroscope offsets x, y, z (three s32)
+constexpr size_t kWallpaperId = 88;         // AT+QXMMIUI
+constexpr size_t kSpecialProduct = 328;     // bit set; kSecondScreenOff: AT+SECSCREEN
+constexpr uint32_t kSecondScreenOff = 0x40;
+constexpr size_t kMainPanelColour = 516;    // calibrated colour 0xRRGGBB, restored by AT+LCMT=1
+constexpr size_t kBackPanelColour = 520;    // the same for the back panel, AT+LCMT_BACK=1
 
 struct Record {
     unsigned char bytes[PYXA_NV_SIZE] = {};

@@ -30,6 +30,7 @@ extern const DeviceModel kInputEventModel;
 extern const DeviceModel kSideKeyModel;
 extern const DeviceModel kFlashLedModel;
 extern const DeviceModel kNfcControllerModel;
+extern const DeviceModel kLcmPanelModel;
 
 namespace {
 
@@ -38,6 +39,7 @@ const DeviceModel *const kModels[] = {
     &kSideKeyModel,
     &kFlashLedModel,
     &kNfcControllerModel,
+    &kLcmPanelModel,
 };
 
 struct Session {
