@@ -585,6 +585,7 @@ int query_charger_update_handler(char *cmd, int arg, char *resp) {
             return RC_ERROR;
         }
         char vendor[50] = {0};
+        errno = 0;  // an empty node is no error of the system: reported as "Success"
         if (::read(fd, vendor, 49) <= 0) {
             body_printf(resp, "\"read error:%s\"", strerror(errno));
             return RC_ATNG;
