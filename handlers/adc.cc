@@ -83,8 +83,16 @@ void wait_for_start_answer() {
     pthread_mutex_unlock(&g_port.mutex);
 }
 
+// Counted from the start, not from when the thread first runs, so that a stop right after
+// a start never sees "no worker" while one is about to run.
+int start_sampling(void *(*fn)(void *), void *arg) {
+    ++g_workers_alive;
+    int rc = start_worker(fn, arg);
+    if (rc != 0) --g_workers_alive;
+    return rc;
+}
+
 struct WorkerLife {
-    WorkerLife() { ++g_workers_alive; }
     ~WorkerLife() { --g_workers_alive; }
 };
 
@@ -330,7 +338,7 @@ int adc_handler(char *cmd, int arg, char *resp) {
             return RC_OK;
         }
         g_eadc_run = 1;
-        if (start_worker(eadc_thread, nullptr) != 0) EM_LOGE("create eadc thread error:%s", strerror(errno));
+        if (start_sampling(eadc_thread, nullptr) != 0) EM_LOGE("create eadc thread error:%s", strerror(errno));
         return RC_OK;
     }
     if (line_is(cmd, "AT+EADC=0")) {
@@ -387,7 +395,7 @@ int batadc_handler(char *cmd, int arg, char *resp) {
             return RC_OK;
         }
         g_batadc_run = 1;
-        if (start_worker(batadc_thread, nullptr) != 0) {
+        if (start_sampling(batadc_thread, nullptr) != 0) {
             EM_LOGE("create batadc thread error:%s", strerror(errno));
             g_batadc_run = 0;
             return RC_ERROR;
@@ -441,7 +449,7 @@ int usb_voltage_sample_handler(char *cmd, int arg, char *resp) {
         }
         store_vbus("null");
         g_vbus_run = 1;
-        if (start_worker(vbus_thread, block) != 0) {
+        if (start_sampling(vbus_thread, block) != 0) {
             EM_LOGE("create vbus thread error:%s", strerror(errno));
             delete block;
             g_vbus_run = 0;
