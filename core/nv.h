@@ -19,7 +19,8 @@ constexpr size_t kUpdateFlag = 392;       // bit 0 delayed reset, bit 5 factory 
 constexpr size_t kAssemblyAtMode = 488;
 constexpr size_t kDefaultAtMode = 664;    // one character
 constexpr size_t kFirstBootDone = 688;
-constexpr size_t kEadcWord = 460;        // signed word answered by AT+EADC=6
+constexpr size_t kDpdtService = 104;      // 1 asks the DPDT service to run; the debug-port close clears it
+constexpr size_t kEadcWord = 460;         // signed word answered by AT+EADC=6
 
 struct Record {
     unsigned char bytes[PYXA_NV_SIZE] = {};

@@ -62,3 +62,14 @@ bool read_node(const char *path, char *buf, size_t size) {
     buf[n] = '\0';
     return true;
 }
+
+std::vector<std::string_view> comma_fields(std::string_view line) {
+    std::vector<std::string_view> fields;
+    for (size_t i = 0; i <= line.size();) {
+        size_t comma = line.find(',', i);
+        if (comma == std::string_view::npos) comma = line.size();
+        if (comma > i) fields.push_back(line.substr(i, comma - i));
+        i = comma + 1;
+    }
+    return fields;
+}

@@ -3,6 +3,8 @@
 // writing the body, asking the test app, reading a node. The NV record's
 // read-modify-write lives in core/nv.h.
 #include <cstddef>
+#include <string_view>
+#include <vector>
 
 #include "core/result.h"
 
@@ -32,3 +34,7 @@ bool test_app_ok(const char *message);
 
 // Reads at most size-1 bytes of a node into buf and terminates it; false on failure.
 bool read_node(const char *path, char *buf, size_t size);
+
+// The non-empty comma-separated fields of a line, as a tokeniser sees them: "1,,0" has
+// two fields, and the first field is the command with its "=" part.
+std::vector<std::string_view> comma_fields(std::string_view line);

@@ -248,6 +248,8 @@ void reset_boot_properties(const std::string &root, bool keep_boot) {
         ok = ok && sim::write_kv(props, "sys.factory.log", nullptr);
     }
     if (!ok) die("cannot update " + props);
+    // The time stamps of events.log count from the start of this boot.
+    if (!keep_boot && !sim::restart_clock(root)) die("cannot write " + root + "/.sim/started");
 }
 
 // ---- serial ports

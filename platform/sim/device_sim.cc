@@ -9,16 +9,28 @@
 #include <cstring>
 
 #include "platform/device.h"
+#include "platform/sim/sequence.h"
 #include "platform/sim/sim.h"
 
 namespace dev {
 
 std::string path(const char *device_path) { return sim::map(device_path); }
 
-int open(const char *p, int flags, mode_t mode) { return ::open(path(p).c_str(), flags | O_CLOEXEC, mode); }
+// Every writer of the facade and of the simulated libraries opens through here, so the
+// rule of attribute nodes (one value, replaced by each write) is kept in this one place:
+// an open for writing empties the node and never appends. A read takes the next value
+// of a node that has a sequence.
+int open(const char *p, int flags, mode_t mode) {
+    if ((flags & O_ACCMODE) == O_RDONLY) sim::sequence_node(p);
+    else if (sim::attribute_node(p)) flags = (flags & ~O_APPEND) | O_TRUNC;
+    return ::open(path(p).c_str(), flags | O_CLOEXEC, mode);
+}
 
 FILE *fopen(const char *p, const char *mode) {
-    std::string m = mode;
+    std::string m = mode ? mode : "";
+    bool writes = m.find_first_of("wa+") != std::string::npos;
+    if (!writes) sim::sequence_node(p);
+    else if (sim::attribute_node(p)) m = m.find('+') != std::string::npos ? "w+" : "w";
     m += 'e';
     return ::fopen(path(p).c_str(), m.c_str());
 }

@@ -16,6 +16,7 @@
 #include "platform/android.h"
 #include "platform/device.h"
 #include "platform/factory.h"
+#include "platform/sim/script.h"
 #include "platform/sim/sim.h"
 
 namespace {
@@ -170,26 +171,8 @@ const char *sendMessage(const char *text) {
     } else if (sim::fault("testapp-refuse")) {
         t_reply = "error";
         reply = t_reply.c_str();
-    } else {
-        // Exact lines first; then "prefix* => reply" lines, the longest prefix winning.
-        size_t best = 0;
-        bool found = false;
-        for (const auto &l : sim::read_lines(sim::state("testapp.replies"))) {
-            if (l.empty() || l[0] == '#') continue;
-            size_t sep = l.find(" =>");
-            if (sep == std::string::npos) continue;
-            std::string pat = l.substr(0, sep), rep = l.substr(sep + 3);
-            if (!rep.empty() && rep[0] == ' ') rep.erase(0, 1);
-            bool exact = pat == msg;
-            bool prefix = !pat.empty() && pat.back() == '*' && msg.compare(0, pat.size() - 1, pat, 0, pat.size() - 1) == 0;
-            if (exact || (prefix && (!found || pat.size() > best))) {
-                best = exact ? SIZE_MAX : pat.size();
-                found = true;
-                t_reply = rep;
-                if (exact) break;
-            }
-        }
-        if (found && t_reply != "(silent)") reply = t_reply.c_str();
+    } else if (sim::script_reply(sim::state("testapp.replies"), msg, t_reply) && t_reply != "(silent)") {
+        reply = t_reply.c_str();
     }
     sim::record("message", msg + " -> " + (reply ? reply : "(silent)"));
     return reply;

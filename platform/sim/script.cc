@@ -2,13 +2,11 @@
 
 #include <cstdlib>
 
+#include "platform/sim/sequence.h"
 #include "platform/sim/sim.h"
 
 namespace sim {
-namespace {
-
-// Glob match where only "*" is special.
-bool glob(const char *p, const char *s) {
+bool glob_match(const char *p, const char *s) {
     const char *star = nullptr, *resume = nullptr;
     while (*s) {
         if (*p == '*') {
@@ -28,22 +26,11 @@ bool glob(const char *p, const char *s) {
     return *p == '\0';
 }
 
-std::string unescape(const std::string &s) {
-    std::string out;
-    for (size_t i = 0; i < s.size(); ++i) {
-        if (s[i] == '\\' && i + 1 < s.size() && (s[i + 1] == 'n' || s[i + 1] == 't' || s[i + 1] == '\\')) {
-            char c = s[++i];
-            out += c == 'n' ? '\n' : c == 't' ? '\t' : '\\';
-        } else {
-            out += s[i];
-        }
-    }
-    return out;
-}
-
-}  // namespace
-
 bool script_reply(const std::string &file, const std::string &message, std::string &reply) {
+    std::string name = file.substr(file.rfind('/') + 1);
+    if (name.size() > 8 && name.compare(name.size() - 8, 8, ".replies") == 0 &&
+        sequence_reply(name.substr(0, name.size() - 8), message, reply))
+        return true;
     long best = -1;  // fixed characters of the best pattern so far
     for (const auto &l : read_lines(file)) {
         if (l.empty() || l[0] == '#') continue;
@@ -55,7 +42,7 @@ bool script_reply(const std::string &file, const std::string &message, std::stri
             reply = unescape(rep);
             return true;
         }
-        if (pat.find('*') == std::string::npos || !glob(pat.c_str(), message.c_str())) continue;
+        if (pat.find('*') == std::string::npos || !glob_match(pat.c_str(), message.c_str())) continue;
         long fixed = 0;
         for (char c : pat) fixed += c != '*';
         if (fixed > best) {

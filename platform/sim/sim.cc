@@ -3,14 +3,17 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <ctime>
 #include <fstream>
 #include <mutex>
 #include <sstream>
 
 #include "platform/log.h"
+#include "platform/sim/sequence.h"
 
 namespace sim {
 namespace {
@@ -41,7 +44,7 @@ void set_root(const std::string &r) {
     g_root_set = true;
 }
 
-std::string map(const char *device_path) {
+std::string normal_path(const char *device_path) {
     std::vector<std::string> parts;
     std::string p = device_path ? device_path : "";
     size_t i = 0;
@@ -56,25 +59,100 @@ std::string map(const char *device_path) {
         }
         i = j + 1;
     }
-    std::string out = root();
-    for (const auto &part : parts) out += "/" + part;
+    std::string out;
+    for (const auto &part : parts) out += (out.empty() ? "" : "/") + part;
     return out;
+}
+
+std::string map(const char *device_path) {
+    std::string rel = normal_path(device_path);
+    return rel.empty() ? root() : root() + "/" + rel;
+}
+
+bool attribute_node(const char *device_path) {
+    std::string rel = normal_path(device_path);
+    for (const char *top : {"sys/", "proc/", "d/"})
+        if (rel.compare(0, strlen(top), top) == 0) return true;
+    return false;
 }
 
 std::string state(const char *name) { return root() + "/.sim/" + name; }
 
+namespace {
+
+long long monotonic_ms() {
+    struct timespec ts {};
+    clock_gettime(CLOCK_MONOTONIC, &ts);
+    return static_cast<long long>(ts.tv_sec) * 1000 + ts.tv_nsec / 1000000;
+}
+
+// The start as written in <root>/.sim/started, or -1.
+long long read_start(const std::string &file) {
+    std::string text;
+    if (!read_file(file, text) || text.empty()) return -1;
+    char *end = nullptr;
+    long long v = strtoll(text.c_str(), &end, 10);
+    return end != text.c_str() ? v : -1;
+}
+
+// Writes the start so that racing writers agree: the file appears whole or not at all,
+// and only the first of several creators wins (link fails when the name exists).
+void create_start(const std::string &file, long long start, bool replace) {
+    std::string tmp = file + ".tmp." + std::to_string(getpid()) + "." + std::to_string(start);
+    {
+        std::ofstream out(tmp, std::ios::trunc);
+        out << start << "\n";
+    }
+    if (replace) {
+        ::rename(tmp.c_str(), file.c_str());
+    } else {
+        (void)!::link(tmp.c_str(), file.c_str());
+        ::unlink(tmp.c_str());
+    }
+}
+
+}  // namespace
+
+long long now_ms() {
+    int saved = errno;
+    std::string file = state("started");
+    long long now = monotonic_ms();
+    long long start = read_start(file);
+    if (start < 0) {
+        create_start(file, now, false);
+        start = read_start(file);
+    } else if (start > now) {
+        // Kept from before the host last booted: the monotonic clock began again.
+        create_start(file, now, true);
+        start = now;
+    }
+    errno = saved;
+    return start < 0 || start > now ? 0 : now - start;
+}
+
+bool restart_clock(const std::string &r) {
+    create_start(r + "/.sim/started", monotonic_ms(), true);
+    return read_start(r + "/.sim/started") >= 0;
+}
+
 void record(const char *kind, const std::string &detail) {
-    std::string line = kind;
-    line += ' ';
-    for (char c : detail) line += (c == '\n') ? '|' : c;
-    line += '\n';
+    static std::mutex events_mu;  // time stamps go into the log in the order taken
+    int saved = errno;
+    std::string text = std::string(kind) + " ";
+    for (char c : detail) text += (c == '\n') ? '|' : c;
+    text += '\n';
     std::string file = state("events.log");
-    std::lock_guard<std::mutex> lk(g_mu);
-    int fd = ::open(file.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
-    if (fd < 0) return;
-    ssize_t n = ::write(fd, line.data(), line.size());
-    (void)n;
-    ::close(fd);
+    {
+        std::lock_guard<std::mutex> lk(events_mu);
+        std::string line = std::to_string(now_ms()) + " " + text;
+        int fd = ::open(file.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+        if (fd >= 0) {
+            ssize_t n = ::write(fd, line.data(), line.size());
+            (void)n;
+            ::close(fd);
+        }
+    }
+    errno = saved;
 }
 
 bool fault(const char *name) {
@@ -89,6 +167,16 @@ std::string config(const char *key, const char *def) {
 }
 
 bool read_file(const std::string &host_path, std::string &out) {
+    // A node of the phone read by the simulator itself (the shell's cat) takes the next
+    // value of its sequence too.
+    std::string rel;
+    {
+        std::lock_guard<std::mutex> lk(g_mu);
+        if (g_root_set && host_path.size() > g_root.size() + 1 && host_path.compare(0, g_root.size(), g_root) == 0 &&
+            host_path[g_root.size()] == '/')
+            rel = host_path.substr(g_root.size());
+    }
+    if (!rel.empty() && rel.compare(0, 6, "/.sim/") != 0) sequence_node(rel.c_str());
     std::ifstream in(host_path, std::ios::binary);
     if (!in) return false;
     std::ostringstream ss;
@@ -122,6 +210,14 @@ std::vector<std::string> read_lines(const std::string &host_path) {
 }
 
 bool read_kv(const std::string &file, const std::string &key, std::string &value) {
+    // The scripts of the simulated hardware may give a key a sequence of values.
+    size_t slash = file.rfind('/');
+    if (slash != std::string::npos && slash >= 5 && file.compare(slash - 5, 5, "/.sim") == 0) {
+        std::string name = file.substr(slash + 1);
+        if ((name == "sensor" || name == "audio" || name == "modem" || name == "config") &&
+            sequence_next_in(file.substr(0, slash), name + ":" + key, value))
+            return true;
+    }
     for (const auto &l : read_lines(file)) {
         if (l.empty() || l[0] == '#') continue;
         size_t eq = l.find('=');

@@ -15,12 +15,25 @@ void set_root(const std::string &root);
 // A device path (absolute, or relative to "/") to the host path inside the sandbox.
 // ".." never climbs above the root.
 std::string map(const char *device_path);
+// The device path in its plain form: no leading "/", no "." or "..", single slashes.
+std::string normal_path(const char *device_path);
+// Attribute nodes (sysfs, procfs, the regmap and other debugfs nodes: everything under
+// sys/, proc/ and d/) hold one value that every write replaces, whatever the open flags;
+// every other file behaves as a real file.
+bool attribute_node(const char *device_path);
 // A file of the simulator's own state: <root>/.sim/<name>.
 std::string state(const char *name);
 
-// Appends "<kind> <detail>" to <root>/.sim/events.log: every device effect that the
+// Appends "<ms> <kind> <detail>" to <root>/.sim/events.log: every device effect that the
 // simulated phone does not really perform (reboot, clock, format, shell, messages...).
+// <ms> is now_ms(). errno is left as the caller had it.
 void record(const char *kind, const std::string &detail);
+// Milliseconds since the simulated phone started, on the host's monotonic clock. The start
+// is kept in <root>/.sim/started, so the daemon, its restarts and the station tools of one
+// sandbox share one time base; the launcher sets it afresh at each boot.
+long long now_ms();
+// Makes "now" the start of the simulated phone in the sandbox root given.
+bool restart_clock(const std::string &root);
 // True when <root>/.sim/faults holds a line equal to name (read on every call, so a
 // running simulator can be given faults by editing the file).
 bool fault(const char *name);

@@ -132,7 +132,10 @@ TEST_F(SimTest, ShellRedirectsIntoSandboxNodes) {
     EXPECT_EQ(dev::shell("echo 1 > /sys/class/power_supply/cms/factory_mode_state"), 0);
     EXPECT_EQ(box.read("/sys/class/power_supply/cms/factory_mode_state"), "1\n");
     EXPECT_EQ(dev::shell("echo more >> /sys/class/power_supply/cms/factory_mode_state"), 0);
-    EXPECT_EQ(box.read("/sys/class/power_supply/cms/factory_mode_state"), "1\nmore\n");
+    EXPECT_EQ(box.read("/sys/class/power_supply/cms/factory_mode_state"), "more\n");  // a node holds one value
+    EXPECT_EQ(dev::shell("echo more >> /data/vendor/engineermode/log.txt"), 0);
+    EXPECT_EQ(dev::shell("echo again >> /data/vendor/engineermode/log.txt"), 0);
+    EXPECT_EQ(box.read("/data/vendor/engineermode/log.txt"), "more\nagain\n");
 }
 
 TEST_F(SimTest, ShellNeverLeavesTheSandbox) {

@@ -2,28 +2,56 @@
 
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
+#include <thread>
 
+#include "platform/sim/sequence.h"
 #include "platform/sim/sim.h"
 
 namespace fs = std::filesystem;
 
-Sandbox::Sandbox() {
-    char tmpl[] = "/tmp/ftcmd-test.XXXXXX";
-    if (mkdtemp(tmpl) == nullptr) throw std::runtime_error("mkdtemp failed");
-    dir = tmpl;
-    root = dir + "/root";
-    fs::copy(FTCMD_DEVICE_TREE, root, fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+namespace {
+
+std::string temp_base() {
+    for (const char *var : {"FTCMD_TEST_TMP", "TMPDIR"}) {
+        const char *v = getenv(var);
+        if (v && *v) return v;
+    }
+    return "/tmp";
 }
 
-Sandbox::~Sandbox() {
-    std::error_code ec;
-    fs::remove_all(dir, ec);
+// A daemon that is still winding down may create a file while we remove the tree; a few
+// rounds finish the job.
+void remove_tree(const std::string &dir) {
+    for (int round = 0; round < 20; ++round) {
+        std::error_code ec;
+        fs::remove_all(dir, ec);
+        if (!fs::exists(fs::symlink_status(dir, ec))) return;
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
 }
+
+}  // namespace
+
+Sandbox::Sandbox() {
+    std::string tmpl = temp_base() + "/ftcmd-test.XXXXXX";
+    if (mkdtemp(tmpl.data()) == nullptr) throw std::runtime_error("mkdtemp failed in " + temp_base());
+    dir = tmpl;
+    root = dir + "/root";
+    try {
+        fs::copy(FTCMD_DEVICE_TREE, root, fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    } catch (...) {
+        remove_tree(dir);
+        throw;
+    }
+}
+
+Sandbox::~Sandbox() { remove_tree(dir); }
 
 void Sandbox::activate() const { sim::set_root(root); }
 
@@ -54,7 +82,25 @@ void Sandbox::set_prop(const std::string &name, const std::string &value) const 
     sim::write_kv(root + "/.sim/properties", name, &value);
 }
 
-std::string Sandbox::events() const { return read("/.sim/events.log"); }
+std::vector<Event> Sandbox::event_list() const {
+    std::vector<Event> out;
+    std::istringstream in(read("/.sim/events.log"));
+    for (std::string l; std::getline(in, l);) {
+        size_t a = l.find(' ');
+        if (a == std::string::npos) continue;
+        size_t b = l.find(' ', a + 1);
+        Event e{strtoll(l.c_str(), nullptr, 10), l.substr(a + 1, b == std::string::npos ? b : b - a - 1),
+                b == std::string::npos ? "" : l.substr(b + 1)};
+        out.push_back(e);
+    }
+    return out;
+}
+
+std::string Sandbox::events() const {
+    std::string out;
+    for (const auto &e : event_list()) out += e.kind + " " + e.detail + "\n";
+    return out;
+}
 
 void Sandbox::fault(const std::string &name) const {
     std::ofstream(root + "/.sim/faults", std::ios::app) << name << "\n";
@@ -63,4 +109,8 @@ void Sandbox::fault(const std::string &name) const {
 void Sandbox::reply(const std::string &message, const std::string &reply) const {
     std::string script = read("/.sim/testapp.replies");
     write("/.sim/testapp.replies", message + " => " + reply + "\n" + script);
+}
+
+void Sandbox::sequence(const std::string &what, const std::vector<std::string> &values) const {
+    if (!sim::sequence_set(root, what, values)) throw std::runtime_error("cannot set the sequence " + what);
 }

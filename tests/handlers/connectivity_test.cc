@@ -1,0 +1,269 @@
+// Bluetooth, GPS, WLAN address and antenna-chain commands: exact frames, the files they
+// write (byte order of the addresses), the shell lines and modem requests they make.
+#include <algorithm>
+#include <chrono>
+#include <filesystem>
+#include <sstream>
+#include <thread>
+
+#include "handlers/connectivity.h"
+#include "tests/support/daemon.h"
+#include "tests/support/in_process.h"
+
+namespace {
+
+const char *kBtNv = "/mnt/vendor/persist/bluetooth/.bt_nv.bin";
+const char *kMac = "/persist/wlan_mac.bin";
+const char *kMacFallback = "/mnt/vendor/persist/wlan_mac.bin";
+
+std::string mac_lines(const std::string &mac, const std::string &second) {
+    return "Intf0MacAddress=" + mac + "\nIntf1MacAddress=" + second + "\nIntf2MacAddress=" + mac + "\nIntf3MacAddress=" + mac +
+           "\n";
+}
+std::string frame(const std::string &line, const std::string &body, const std::string &word) {
+    return line + "\r\n" + body + "\r\n" + word + "\r\n";
+}
+void prepend(const Sandbox &b, const std::string &file, const std::string &line) {
+    b.write(file, line + "\n" + b.read(file));
+}
+
+using Setup = void (*)(const Sandbox &);
+struct Case {
+    const char *name;
+    std::string line;
+    Setup setup;
+    std::string body;
+    const char *word;
+    std::vector<std::string> events = {};  // in this order
+    const char *absent = nullptr;          // never recorded
+    std::vector<std::pair<std::string, std::string>> files = {};
+};
+
+std::string case_name(const ::testing::TestParamInfo<Case> &info) { return info.param.name; }
+
+void expect_in_order(const std::string &log, const std::vector<std::string> &texts) {
+    size_t at = 0;
+    for (const auto &t : texts) {
+        size_t pos = log.find(t, at);
+        ASSERT_NE(pos, std::string::npos) << "missing in order: " << t << "\n" << log;
+        at = pos + t.size();
+    }
+}
+
+class Wireless : public InProcess {
+protected:
+    void SetUp() override {
+        InProcess::SetUp();
+        is_sp = 0;
+    }
+    void TearDown() override {
+        box.write("/.sim/faults", "");
+        serve("AT+QXGPS=0", SRC_TCP, 19);  // the GPS state lives for the process
+        InProcess::TearDown();
+    }
+};
+class Connectivity : public Wireless, public ::testing::WithParamInterface<Case> {};
+
+TEST_P(Connectivity, Answers) {
+    const Case &c = GetParam();
+    if (c.setup) c.setup(box);
+    const std::string want = frame(c.line, c.body, c.word);
+    EXPECT_EQ(serve(c.line, SRC_TCP, want.size()), want);
+    const std::string log = box.events();
+    expect_in_order(log, c.events);
+    if (c.absent) {
+        EXPECT_EQ(log.find(c.absent), std::string::npos) << log;
+    }
+    for (const auto &[path, text] : c.files) EXPECT_EQ(box.read(path), text) << path;
+}
+
+void bt_item_order(const Sandbox &b) { b.write(kBtNv, std::string("\2\0\2\x77\x77\1\5\6\x11\x22\x33\x44\x55\x66", 14)); }
+void bt_no_address(const Sandbox &b) { b.write(kBtNv, std::string("\2\0\1\x77", 4)); }
+void no_bt_nv(const Sandbox &b) { std::filesystem::remove(b.path(kBtNv)); }
+void bt_nv_stays_missing(const Sandbox &b) {
+    no_bt_nv(b);
+    b.fault("ext-system");
+}
+void dut_on(const Sandbox &b) { b.set_prop("bluetooth.bdt.kaeldut", "is true"); }
+void cnss_running(const Sandbox &b) { b.set_prop("init.svc.cnss-daemon", "running"); }
+void refuse(const Sandbox &b) { b.fault("testapp-refuse"); }
+void six_devices(const Sandbox &b) { b.write("/data/vendor/engineermode/bt_device", "aa\nbb\ncc\ndd\nee\nff\n"); }
+void no_devices(const Sandbox &b) { std::filesystem::remove(b.path("/data/vendor/engineermode/bt_device")); }
+void long_device(const Sandbox &b) { b.write("/data/vendor/engineermode/bt_device", std::string(300, 'x') + "\n"); }
+void mac_fallback(const Sandbox &b) {
+    std::filesystem::remove(b.path(kMac));
+    b.write(kMacFallback, "Intf0MacAddress=0A1B2C3D4E5F\n");
+}
+void no_mac(const Sandbox &b) { std::filesystem::remove(b.path(kMac)); }
+void mac_without_eq(const Sandbox &b) { b.write(kMac, "garbage\n"); }
+void no_chown(const Sandbox &b) { b.fault("chown"); }
+
+const std::string kBtNvDefault("\1\0\6\x55\x44\x33\x22\x11\x00", 9);
+
+INSTANTIATE_TEST_SUITE_P(Bluetooth, Connectivity, ::testing::Values(
+    Case{"ReadAddress", "AT+EMBT=5", nullptr, "+EMBT: \"001122334455\"", "OK"},
+    Case{"ReadAddressSkipsOtherItems", "AT+EMBT=5", bt_item_order, "+EMBT: \"665544332211\"", "OK"},
+    Case{"ReadAddressNoItem", "AT+EMBT=5", bt_no_address, "", "ERROR"},
+    Case{"ReadAddressNoFile", "AT+EMBT=5", no_bt_nv, "", "ERROR"},
+    Case{"TestModeOff", "AT+EMBT=4", nullptr, "", "ERROR"},
+    Case{"TestModeOn", "AT+EMBT=4", dut_on, "", "OK"},
+    Case{"WriteAddress", "AT+EMBT=0,BT,A1B2C3D4E5F6", nullptr, "", "OK", {"shell btnvtool -b F6.E5.D4.C3.B2.A1\n"}, nullptr,
+         {{kBtNv, std::string("\1\0\6\xF6\xE5\xD4\xC3\xB2\xA1", 9)}}},
+    Case{"WriteAddressLowerCase", "AT+EMBT=0,bt,a1b2c3d4e5f6", nullptr, "", "OK", {"shell btnvtool -b F6.E5.D4.C3.B2.A1\n"}},
+    Case{"WriteAddressShortCountsZero", "AT+EMBT=0,BT,1234", nullptr, "", "OK", {"shell btnvtool -b 00.00.00.00.34.12\n"}},
+    Case{"WriteAddressMissing", "AT+EMBT=0,BT", nullptr, "", "ERROR", {}, "btnvtool", {{kBtNv, kBtNvDefault}}},
+    Case{"WriteAddressNoFileAfter", "AT+EMBT=0,BT,001122334455", bt_nv_stays_missing, "\"No such file or directory\"", "ERROR"},
+    Case{"EnterTestMode", "AT+EMBT=1", nullptr, "", "OK", {"shell /system/bin/bdt entrydut 2>&1\n"}},
+    Case{"EnterTestModeByPrefix", "AT+EMBT=10", nullptr, "", "OK", {"shell /system/bin/bdt entrydut 2>&1\n"}},
+    Case{"TransmitContinuous", "AT+EMBT=1,2402 7", nullptr, "", "OK", {"shell /system/bin/bdt txcontinuous 2402 7 2>&1\n"}},
+    Case{"TransmitRefusesShellText", "AT+EMBT=1,5;reboot", nullptr, "", "ERROR", {}, "bdt"},
+    Case{"LeaveTestModeStartsCnss", "AT+EMBT=2", nullptr, "", "OK",
+         {"shell /system/bin/sh -c \"/system/bin/bdt exitdut\"\n", "shell /system/bin/sh -c \"start cnss-daemon\"\n"}},
+    Case{"LeaveTestModeCnssRunning", "AT+EMBT=2", cnss_running, "", "OK", {"bdt exitdut"}, "start cnss"},
+    Case{"On", "AT+EMBT=6", nullptr, "", "OK", {"message bluetooth on -> ok"}},
+    Case{"OnRefused", "AT+EMBT=6", refuse, "", "ERROR"},
+    Case{"Off", "AT+EMBT=8", nullptr, "", "OK", {"message bluetooth off -> ok"}},
+    Case{"OffRefused", "AT+EMBT=8", refuse, "", "ERROR"},
+    Case{"DevicesFirstFive", "AT+EMBT=7", six_devices, "\r\naa\r\nbb\r\ncc\r\ndd\r\nee\r\n", "OK"},
+    Case{"DevicesLongLineSplits", "AT+EMBT=7", long_device, "\r\n" + std::string(255, 'x') + "\r\n" + std::string(45, 'x') + "\r\n",
+         "OK"},
+    Case{"DevicesMissing", "AT+EMBT=7", no_devices, "", "ERROR"},
+    Case{"Unknown", "AT+EMBT=9", nullptr, "", "ERROR"}), case_name);
+
+INSTANTIATE_TEST_SUITE_P(WlanMac, Connectivity, ::testing::Values(
+    Case{"Read", "AT+QXWMAC=0", nullptr, "\"00A0C6112233\"", "OK"},
+    Case{"ReadFallback", "AT+QXWMAC=0", mac_fallback, "\"0A1B2C3D4E5F\"", "OK"},
+    Case{"ReadNoFile", "AT+QXWMAC=0", no_mac, "\r\n\"\"\r\n", "ERROR"},
+    Case{"ReadNoEquals", "AT+QXWMAC=0", mac_without_eq, "\r\n\"\"\r\n", "ERROR"},
+    Case{"Write", "AT+QXWMAC=1,02AABBCCDDEE", nullptr, "", "OK",
+         {"chown /persist/wlan_mac.bin 1000:1000", "shell chmod 0664 /persist/wlan_mac.bin\n"}, nullptr,
+         {{kMac, mac_lines("02AABBCCDDEE", "04AABBCCDDEE")}}},
+    Case{"WriteQuotedWraps", "AT+QXWMAC=1,\"FFAABBCCDDEE\"", nullptr, "", "OK", {}, nullptr,
+         {{kMac, mac_lines("FFAABBCCDDEE", "01AABBCCDDEE")}}},
+    Case{"WriteCarry", "AT+QXWMAC=1,0eaabbccddee", nullptr, "", "OK", {}, nullptr, {{kMac, mac_lines("0eaabbccddee", "10aabbccddee")}}},
+    Case{"WriteFEWrapsToZero", "AT+QXWMAC=1,FEAABBCCDDEE", nullptr, "", "OK", {}, nullptr,
+         {{kMac, mac_lines("FEAABBCCDDEE", "00AABBCCDDEE")}}},
+    Case{"WriteUnclosedQuote", "AT+QXWMAC=1,\"FFAABBCCDDEE", nullptr, "", "ERROR", {}, "chown"},
+    Case{"WriteNotHex", "AT+QXWMAC=1,G0AABBCCDDEE", nullptr, "", "ERROR", {}, "chown"},
+    Case{"WriteMissing", "AT+QXWMAC=1", nullptr, "", "ERROR", {}, "chown"},
+    Case{"WriteLineBreakRefused", "AT+QXWMAC=1,00A0C6\tIntf9", nullptr, "", "ERROR", {}, "chown"},
+    Case{"WriteChownRefused", "AT+QXWMAC=1,02AABBCCDDEE", no_chown, "\"Operation not permitted\"", "ERROR",
+         {"shell chmod 0664 /persist/wlan_mac.bin"}, nullptr, {{kMac, mac_lines("02AABBCCDDEE", "04AABBCCDDEE")}}},
+    Case{"Unknown", "AT+QXWMAC=2", nullptr, "", "ERROR"}), case_name);
+
+TEST_F(Wireless, UnclosedQuoteLeavesTheFileAlone) {
+    const std::string before = box.read(kMac);
+    EXPECT_EQ(serve("AT+QXWMAC=1,\"FFAABBCCDDEE"), frame("AT+QXWMAC=1,\"FFAABBCCDDEE", "", "ERROR"));
+    EXPECT_EQ(box.read(kMac), before);
+}
+
+TEST_F(Wireless, AntennaChainIsStoredNotRun) {
+    EXPECT_EQ(serve("AT+QXWANT=1"), frame("AT+QXWANT=1", "", "OK"));
+    EXPECT_STREQ(g_antsel_cmd, "/system/bin/sh -c \"iwpriv wlan0 ena_chain 8\"");
+    EXPECT_EQ(serve("AT+QXWANT=0"), frame("AT+QXWANT=0", "", "OK"));
+    EXPECT_STREQ(g_antsel_cmd, "/system/bin/sh -c \"iwpriv wlan0 ena_chain 7\"");
+    EXPECT_EQ(serve("AT+QXWANT=2"), frame("AT+QXWANT=2", "", "ERROR"));
+    EXPECT_STREQ(g_antsel_cmd, "/system/bin/sh -c \"iwpriv wlan0 ena_chain 7\"");
+    EXPECT_EQ(box.events().find("iwpriv"), std::string::npos);
+}
+
+// GPS: a line and its answer, in order, from a closed engine.
+struct Step {
+    std::string line, body;
+    const char *word;
+};
+struct GpsCase {
+    const char *name;
+    Setup setup;
+    int at_mode;
+    std::vector<Step> steps;
+    std::vector<std::string> events;  // the gps and message records, in order, exactly
+};
+
+class GpsSteps : public Wireless, public ::testing::WithParamInterface<GpsCase> {};
+
+std::vector<std::string> gps_records(const std::string &log) {
+    std::vector<std::string> out;
+    std::istringstream in(log);
+    for (std::string l; std::getline(in, l);)
+        if (l.rfind("gps ", 0) == 0 || l.rfind("message ", 0) == 0) out.push_back(l);
+    return out;
+}
+
+TEST_P(GpsSteps, Answer) {
+    const GpsCase &c = GetParam();
+    is_sp = c.at_mode;
+    if (c.setup) c.setup(box);
+    box.write("/.sim/events.log", "");
+    for (const Step &s : c.steps) {
+        const std::string want = frame(s.line, s.body, s.word);
+        EXPECT_EQ(serve(s.line, SRC_TCP, want.size()), want);
+    }
+    EXPECT_EQ(gps_records(box.events()), c.events);
+}
+
+void gps_down(const Sandbox &b) { b.fault("gps"); }
+void gps_ng(const Sandbox &b) { prepend(b, "/.sim/modem", "gps.5=ng"); }
+
+INSTANTIATE_TEST_SUITE_P(Gps, GpsSteps, ::testing::Values(
+    GpsCase{"OpenOnce", nullptr, 0, {{"AT+QXGPS=1", "", "OK"}, {"AT+QXGPS=1", "", "OK"}},
+            {"message keep_screen_on 2 -> ok", "gps option 1", "message keep_screen_on 2 -> ok"}},
+    GpsCase{"OpenSecondMode", nullptr, 0, {{"AT+QXGPS=3", "", "OK"}}, {"message keep_screen_on 2 -> ok", "gps option 3"}},
+    GpsCase{"AtModeNoScreen", nullptr, 1, {{"AT+QXGPS=1", "", "OK"}}, {"gps option 1"}},
+    GpsCase{"ScreenRefused", refuse, 0, {{"AT+QXGPS=1", "", "ERROR"}}, {"message keep_screen_on 2 -> error"}},
+    GpsCase{"OpenFailsStaysClosed", gps_down, 1, {{"AT+QXGPS=1", "", "ERROR"}, {"AT+QXGPS=2", "", "ERROR"}},
+            {"gps option 1 (failed)"}},
+    GpsCase{"StreamNeedsOpen", nullptr, 1, {{"AT+QXGPS=2", "", "ERROR"}}, {}},
+    GpsCase{"Results", nullptr, 1, {{"AT+QXGPS=5", "OK,cn0=41", "OK"}, {"AT+QXGPS=6", "OK,ttff=28", "OK"}},
+            {"gps option 5 -> OK,cn0=41", "gps option 6 -> OK,ttff=28"}},
+    GpsCase{"ResultNg", gps_ng, 1, {{"AT+QXGPS=5", "", "ATNG"}}, {"gps option 5 -> ng"}},
+    GpsCase{"ResultFails", gps_down, 1, {{"AT+QXGPS=6", "", "ERROR"}}, {"gps option 6 (failed)"}},
+    GpsCase{"ResultScreenRefused", refuse, 0, {{"AT+QXGPS=5", "", "ERROR"}}, {"message keep_screen_on 2 -> error"}},
+    GpsCase{"CloseThenOpenAgain", nullptr, 1, {{"AT+QXGPS=1", "", "OK"}, {"AT+QXGPS=0", "", "OK"}, {"AT+QXGPS=1", "", "OK"}},
+            {"gps option 1", "gps option 0", "gps option 1"}},
+    GpsCase{"Unknown", nullptr, 1, {{"AT+QXGPS=4", "", "ERROR"}}, {}}), [](const auto &i) { return std::string(i.param.name); });
+
+TEST_F(Wireless, GpsFailedCloseKeepsTheEngineOpen) {
+    is_sp = 1;
+    EXPECT_EQ(serve("AT+QXGPS=1"), frame("AT+QXGPS=1", "", "OK"));
+    box.fault("gps");
+    EXPECT_EQ(serve("AT+QXGPS=0"), frame("AT+QXGPS=0", "", "ERROR"));
+    box.write("/.sim/faults", "");
+    box.write("/.sim/events.log", "");
+    EXPECT_EQ(serve("AT+QXGPS=1"), frame("AT+QXGPS=1", "", "OK"));
+    EXPECT_EQ(box.events().find("gps option 1"), std::string::npos);  // still open
+}
+
+}  // namespace
+
+// The GPS stream over a real TCP station: raw reply text every 300 ms, until AT+QXGPS=0.
+TEST(GpsStream, RepliesArriveEvery300MsUntilClosed) {
+    Sandbox box;
+    Daemon d(box, "console-at=sendAT");  // AT mode: no screen to keep on
+    int s = d.connect_tcp();
+    ASSERT_GE(s, 0);
+    auto exchange = [&](const std::string &line, size_t want) {
+        send(s, line.data(), line.size(), MSG_NOSIGNAL);
+        return read_some(s, want);
+    };
+    const std::string opened = frame("AT+QXGPS=1", "", "OK"), streaming = frame("AT+QXGPS=2", "", "OK");
+    EXPECT_EQ(exchange("AT+QXGPS=1", opened.size()), opened);
+    EXPECT_EQ(exchange("AT+QXGPS=2", streaming.size()), streaming);
+    const std::string value = "+QXGPS: 12,38.5,3.2";
+    const auto start = std::chrono::steady_clock::now();
+    std::string stream = read_some(s, value.size() * 5, 3000);
+    const double ms = std::chrono::duration<double, std::milli>(std::chrono::steady_clock::now() - start).count();
+    std::string five;
+    for (int i = 0; i < 5; ++i) five += value;
+    EXPECT_EQ(stream, five);
+    // Five values, the first at once: four periods of 300 ms.
+    EXPECT_GT(ms, 4 * 300 * 0.8);
+    EXPECT_LT(ms, 4 * 300 * 2.0);
+    const std::string closed = frame("AT+QXGPS=0", "", "OK");
+    send(s, "AT+QXGPS=0", 10, MSG_NOSIGNAL);
+    std::string after = read_some(s, 4096, 600);
+    ASSERT_NE(after.find(closed), std::string::npos) << after;
+    // At most one value was already on its way; then the stream is over.
+    EXPECT_EQ(read_some(s, 4096, 700), "");
+    close(s);
+}
