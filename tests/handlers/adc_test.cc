@@ -111,6 +111,8 @@ struct Case {
     std::string events = "";
 };
 
+void PrintTo(const Case &c, std::ostream *os) { *os << c.line << " " << c.tag; }
+
 class AdcLine : public AdcBase, public ::testing::WithParamInterface<Case> {};
 
 TEST_P(AdcLine, Answers) {
@@ -164,7 +166,7 @@ INSTANTIATE_TEST_SUITE_P(OneShot, AdcLine, ::testing::Values(
     Case{.line = "AT+BATADC=0", .tag = "Adapter2", .given = {{kAdapter, "2"}}, .word = "OK"},
     Case{.line = "AT+BATADC=2", .tag = "", .word = "ERROR"},
     Case{.line = "AT+QX_ADC_REG=1", .tag = "", .body = "\r\n\"305e: 80\n\"\r\n", .word = "ATOK",
-         .after = {{kRegmap + "count", "1\n"}, {kRegmap + "address", "0x305e\n"}}},
+         .after = {{kRegmap + "count", "1"}, {kRegmap + "address", "0x305e"}}},
     Case{.line = "AT+QX_ADC_REG=1", .tag = "NoCount", .given = {{kRegmap + "count", ""}},
          .body = "\"write /d/regmap/spmi0-00/count error:No such file or directory\"", .word = "ATNG"},
     Case{.line = "AT+QX_ADC_REG=1", .tag = "NoAddress", .given = {{kRegmap + "address", ""}},
@@ -366,6 +368,45 @@ TEST_F(Vbus, StopDuringTheRunStoresNothing) {
     expect_answer("AT+QX_VBUS_VOLT=1", "\"null\"", "ATNG");
     ASSERT_TRUE(wait_workers_gone(5000));
     EXPECT_EQ(stored(), "null");
+}
+
+struct SeriesCase {
+    std::string name;
+    std::vector<std::string> microvolts;
+    std::string stored;
+};
+
+class VbusSeries : public Vbus, public ::testing::WithParamInterface<SeriesCase> {};
+
+TEST_P(VbusSeries, StoresMaxMinAverageInMillivolts) {
+    const SeriesCase &c = GetParam();
+    box.write(kOnline, "0\n");
+    box.sequence("/sys/class/power_supply/usb/voltage_now", c.microvolts);
+    const std::string line = "AT+QX_VBUS_VOLT=0,0,10," + std::to_string(c.microvolts.size());
+    expect_answer(line, "", "ATOK");
+    ASSERT_TRUE(wait_workers_gone(5000));
+    EXPECT_EQ(stored(), c.stored);
+    expect_answer("AT+QX_VBUS_VOLT=1", "\"" + c.stored + "\"", "ATOK");
+}
+
+// clang-format off
+INSTANTIATE_TEST_SUITE_P(Vbus, VbusSeries, ::testing::Values(
+    SeriesCase{"Replug", {"5000999", "5100000", "4899999", "-1500"}, "5100,-1,3749"},
+    SeriesCase{"TruncatedTowardZero", {"4999", "-999"}, "4,0,2"},
+    SeriesCase{"MaximumNeverBelowZero", {"-2500", "-1999"}, "0,-2,-1"},
+    SeriesCase{"OneSample", {"5012000"}, "5012,5012,5012"}),
+    [](const ::testing::TestParamInfo<SeriesCase> &i) { return i.param.name; });
+// clang-format on
+
+TEST_F(Vbus, UnplugEndsTheStartWaitEarly) {
+    box.sequence(kOnline, {"1", "1", "0"});
+    const auto t0 = Clock::now();
+    expect_answer("AT+QX_VBUS_VOLT=0,5000,0,1", "", "ATOK");
+    ASSERT_TRUE(wait_workers_gone(8000));
+    const long ms = ms_between(t0, Clock::now());
+    EXPECT_GE(ms, 2000);  // two whole-second checks, the second seeing the cable out
+    EXPECT_LT(ms, 4500);  // well before the 5 s start delay
+    EXPECT_EQ(stored(), "5012,5012,5012");
 }
 
 // ---- thermal-zone filter and register table

@@ -65,6 +65,8 @@ struct Case {
     Files props = {};           // properties afterwards
 };
 
+void PrintTo(const Case &c, std::ostream *os) { *os << c.line << " " << c.tag; }
+
 class PowerBase : public InProcess {
 protected:
     void SetUp() override {
@@ -386,6 +388,35 @@ TEST_F(PowerTiming, ReplugThatNeverChargesAgainWaitsTwoSeconds) {
     EXPECT_GE(ms, 2000);
     EXPECT_LT(ms, 6000);
     EXPECT_EQ(box.read(kPullDown), "0\n");
+}
+
+// The status node read by read: the initial reading, then one per 100 ms poll.
+std::vector<std::string> statuses(int charging, std::vector<std::string> then) {
+    std::vector<std::string> v(charging, "Charging");
+    v.insert(v.end(), then.begin(), then.end());
+    return v;
+}
+
+TEST_F(PowerTiming, ReplugSeesChargingStopAndResume) {
+    box.sequence(kStatus, statuses(2, {"Discharging", "Discharging", "Discharging", "Charging"}));
+    auto [got, ms] = timed("AT+QX_PWR_CHG=3", 26);
+    EXPECT_EQ(got, "AT+QX_PWR_CHG=3\r\n\r\nATOK\r\n");
+    EXPECT_GE(ms, 400);
+    EXPECT_EQ(box.read(kPullDown), "0\n");
+    std::vector<Event> ev = box.event_list();
+    ASSERT_EQ(ev.size(), 3u) << box.events();
+    EXPECT_EQ(ev[1].detail, "echo 1 >  " + kPullDown);
+    EXPECT_EQ(ev[2].detail, "echo 0 >  " + kPullDown);
+    EXPECT_GE(ev[2].ms - ev[1].ms, 200 - 5);  // two polls while it still charged
+}
+
+TEST_F(PowerTiming, ChargingMustStopWithinNinePolls) {
+    box.sequence(kStatus, statuses(8, {"Discharging", "Charging"}));
+    EXPECT_EQ(timed("AT+QX_PWR_CHG=3", 26).first, "AT+QX_PWR_CHG=3\r\n\r\nATOK\r\n");
+    box.sequence(kStatus, statuses(9, {"Discharging", "Charging"}));
+    const std::string late = "AT+QX_PWR_CHG=3\r\n\r\n\"Discharging\"\r\n\r\nATNG\r\n";
+    EXPECT_EQ(timed("AT+QX_PWR_CHG=3", late.size()).first, late);
+    EXPECT_EQ(box.read(kPullDown), "1\n");
 }
 
 struct RecordCase {
