@@ -1,6 +1,8 @@
 // ADC, voltage and temperature sampling: one-shot readings, the PMIC register read, the
 // streamed EADC and BATADC lines (their figures, periods, stop forms and what they leave
 // behind), the VBUS sampling worker and its stored result, and the thermal-zone filter.
+#include <sys/socket.h>
+
 #include <chrono>
 #include <cstring>
 #include <filesystem>
@@ -292,6 +294,29 @@ TEST_F(Eadc, UnreadableNodeEndsTheStreamAndClearsTheFlag) {
     box.write(kBattery + "current_now", "-1000\n");
     send("AT+EADC=1");  // the flag was cleared, so this starts a new stream
     EXPECT_NE(until("+EADC:").find("+EADC: \"4.12,30.10,0.58,-1.00,4.50\"\r\n"), std::string::npos);
+}
+
+// On the real daemon in AT mode, over TCP: the answer, then lines 300 ms apart with the
+// low voltage raised, and silence once stopped; the cores are left alone.
+TEST(EadcDaemon, StreamsToTheTcpStationUntilStopped) {
+    Sandbox box;
+    box.write(kBattery + "voltage_now", "3600000\n");
+    Daemon d(box, "console-at=sendAT");
+    int s = d.connect_tcp();
+    ASSERT_GE(s, 0);
+    const std::string answer = "AT+EADC=1\r\n\r\nOK\r\n", line = "+EADC: \"3.83,30.10,0.58,-412.00,4.50\"\r\n";
+    const auto t0 = Clock::now();
+    send(s, "AT+EADC=1", 9, MSG_NOSIGNAL);  // a TCP station sends bare lines
+    std::string got = read_some(s, answer.size() + 4 * line.size(), 5000);
+    const long ms = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - t0).count();
+    EXPECT_EQ(got, answer + line + line + line + line);
+    EXPECT_GE(ms, 3 * 300 - 20);
+    send(s, "AT+EADC=0", 9, MSG_NOSIGNAL);
+    std::string after = read_some(s, 4096, 800);
+    EXPECT_NE(after.find("AT+EADC=0\r\n\r\nOK\r\n"), std::string::npos) << after;
+    EXPECT_EQ(read_some(s, 4096, 800), "");
+    EXPECT_EQ(box.read(kCpu4 + "max_cpus"), "4\n");
+    close(s);
 }
 
 // ---- BATADC stream

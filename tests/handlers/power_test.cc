@@ -1,8 +1,11 @@
 // Battery and charging commands: exact frames, the control records the charger
 // controller receives, node writes, properties, test-app messages and the fast-charge
 // result report.
+#include <sys/socket.h>
+
 #include <chrono>
 #include <filesystem>
+#include <thread>
 #include <string>
 #include <utility>
 #include <vector>
@@ -417,6 +420,29 @@ TEST_F(PowerTiming, ChargingMustStopWithinNinePolls) {
     const std::string late = "AT+QX_PWR_CHG=3\r\n\r\n\"Discharging\"\r\n\r\nATNG\r\n";
     EXPECT_EQ(timed("AT+QX_PWR_CHG=3", late.size()).first, late);
     EXPECT_EQ(box.read(kPullDown), "1\n");
+}
+
+// On the real daemon: the averaging form holds the dispatch lock for its whole run, so a
+// command from another channel is answered only after it.
+TEST(PowerDaemon, AveragingBlocksEveryOtherChannel) {
+    Sandbox box;
+    Daemon d(box);
+    int tcp = d.connect_tcp();
+    ASSERT_GE(tcp, 0);
+    ASSERT_TRUE(d.wait_prop("sys.qrcode.view", "0"));
+    const auto t0 = std::chrono::steady_clock::now();
+    send(tcp, "AT+QX_PWR_CHG=2,10", 18, MSG_NOSIGNAL);  // a TCP station sends bare lines
+    std::this_thread::sleep_for(std::chrono::milliseconds(150));  // let the TCP line in first
+    int local = d.connect_local();
+    ASSERT_GE(local, 0);
+    send(local, "AT+QXDLJ=0", 10, MSG_NOSIGNAL);
+    EXPECT_EQ(read_some(local, 4096, 3000), "AT+QXDLJ=0\r\n\"1\"\r\nOK\r\n");
+    const auto ms = std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() - t0).count();
+    EXPECT_GE(ms, 10 * 100);
+    const std::string frame = "AT+QX_PWR_CHG=2,10\r\n\r\n\"1480.00\"\r\n\r\nATOK\r\n";
+    EXPECT_EQ(read_some(tcp, frame.size()), frame);
+    close(local);
+    close(tcp);
 }
 
 struct RecordCase {
