@@ -273,6 +273,17 @@ TEST_F(Eadc, SecondStartAnswersOkWithoutASecondWorker) {
     EXPECT_EQ(sampling_workers_alive(), 1);
 }
 
+TEST_F(Eadc, StopAndStartWithinAPeriodLeavesTwoWorkersThatOneStopEnds) {
+    send("AT+EADC=1");
+    until("+EADC:");
+    send("AT+EADC=0");
+    send("AT+EADC=1");  // the first worker is asleep and never sees the flag cleared
+    EXPECT_EQ(sampling_workers_alive(), 2);
+    send("AT+EADC=0");
+    ASSERT_TRUE(wait_workers_gone(3000));
+    EXPECT_EQ(box.read(kCpu4 + "max_cpus"), "4");
+}
+
 TEST_F(Eadc, UnreadableNodeEndsTheStreamAndClearsTheFlag) {
     fs::remove(box.path(kBattery + "current_now"));
     send("AT+EADC=1");
