@@ -14,6 +14,14 @@
 // A station hangs up by sending ^D (0x04) at the start of a line: the daemon's side is
 // in canonical mode, so its read returns 0 exactly as when a USB cable is pulled, and
 // the daemon runs its reopen path.
+//
+// Like init on a phone, the launcher restarts a daemon that ends on its own (a fatal
+// signal, a crash), records it in events.log and counts it; one that keeps ending within
+// moments of its start is given up after a few tries. --no-restart ends with the daemon.
+//
+// Given a command after the options (key, sw, touch, send, seq), it does not start a
+// phone but acts on the one running in --root: input events and device-model lines go
+// through the FIFO <root>/station/devices, sequences into <root>/.sim/sequences.
 #include <arpa/inet.h>
 #include <errno.h>
 #include <fcntl.h>
@@ -37,6 +45,8 @@
 #include <thread>
 #include <vector>
 
+#include "platform/sim/chardev.h"
+#include "platform/sim/sequence.h"
 #include "platform/sim/sim.h"
 
 namespace fs = std::filesystem;
@@ -46,11 +56,19 @@ namespace {
 constexpr int kReadyTimeoutMs = 10000;
 constexpr int kStopGraceMs = 5000;       // after a forwarded signal, before SIGKILL
 constexpr size_t kRelayBacklog = 65536;  // bytes kept for a side that is not reading
+constexpr int kRestartDelayMs = 300;     // between a daemon's end and its restart
+constexpr int kQuickEndMs = 2000;        // a daemon that ends this soon after its start...
+constexpr int kMaxQuickEnds = 5;         // ...this many times in a row is not restarted again
 
 const char *kUsage =
     "usage: ftcmd-sim [--root DIR] [--fresh] [--keep] [--keep-boot]\n"
     "                 [--mode plain|at|normal|assembly | --cmdline TEXT]\n"
-    "                 [--port N] [--local NAME] [--listen ADDR] [--daemon PATH]\n"
+    "                 [--port N] [--local NAME] [--listen ADDR] [--daemon PATH] [--no-restart]\n"
+    "       ftcmd-sim --root DIR key CODE [press|release|click] [eventN]\n"
+    "       ftcmd-sim --root DIR sw CODE VALUE [eventN]\n"
+    "       ftcmd-sim --root DIR touch X Y [eventN]\n"
+    "       ftcmd-sim --root DIR send MODEL TEXT...\n"
+    "       ftcmd-sim --root DIR seq WHAT [VALUE...] | seq --rewind\n"
     "\n"
     "Runs the ftcmd daemon as a simulated phone over a sandbox directory.\n"
     "  --root DIR     the sandbox; made from the default device tree when missing or empty\n"
@@ -63,6 +81,12 @@ const char *kUsage =
     "  --local NAME   abstract local socket name (default ftcmd_cmd_socket)\n"
     "  --listen ADDR  IPv4 address the TCP service binds (default 127.0.0.1)\n"
     "  --daemon PATH  the daemon binary (default: ftcmd next to this program)\n"
+    "  --no-restart   end when the daemon ends on its own (default: restart it, as init does)\n"
+    "\n"
+    "With a command after the options, acts on the phone running in DIR instead:\n"
+    "  key, sw, touch inject input events (a key click by default) into dev/input\n"
+    "  send           sends a line to a device model of the running phone\n"
+    "  seq            gives WHAT a sequence of values (none: removes it); --rewind restarts all\n"
     "\n"
     "A station opens <root>/station/ttyGS0 (and ttyMSM0 in the UART boot modes); they\n"
     "start in raw mode. Sending ^D (0x04) at the start of a line simulates a hang-up of\n"
@@ -80,6 +104,8 @@ struct Options {
     std::string local = "ftcmd_cmd_socket";
     std::string listen = "127.0.0.1";
     std::string daemon;
+    bool restart = true;
+    std::vector<std::string> command;  // a station command on a running phone
 };
 
 [[noreturn]] void die(const std::string &msg, int status = 2) {
@@ -120,6 +146,11 @@ Options parse_args(int argc, char **argv) {
         } else if (a == "--local") o.local = value();
         else if (a == "--listen") o.listen = value();
         else if (a == "--daemon") o.daemon = value();
+        else if (a == "--no-restart") o.restart = false;
+        else if (!a.empty() && a[0] != '-') {
+            for (; i < argc; ++i) o.command.push_back(argv[i]);
+            break;
+        }
         else if (a == "-h" || a == "--help") {
             fputs(kUsage, stdout);
             exit(0);
@@ -417,6 +448,42 @@ int status_code(int status) {
     return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
 }
 
+// ---- station commands on a running phone
+
+int station_command(const Options &o) {
+    if (o.root.empty()) die("a station command needs --root");
+    std::string root = o.root;
+    if (!fs::is_directory(root + "/.sim")) die(root + " is not a sandbox (no .sim/)");
+    const std::vector<std::string> &w = o.command;
+    std::string verb = w[0], line;
+    auto join = [&](size_t from) {
+        std::string t;
+        for (size_t i = from; i < w.size(); ++i) t += (t.empty() ? "" : " ") + w[i];
+        return t;
+    };
+    int code = 0;
+    if (verb == "seq") {
+        if (w.size() == 2 && w[1] == "--rewind") return sim::sequence_rewind(root) ? 0 : 1;
+        if (w.size() < 2) die("seq needs WHAT\n" + std::string(kUsage));
+        std::vector<std::string> values(w.begin() + 2, w.end());
+        if (!sim::sequence_set(root, w[1], values)) die("cannot write " + root + "/.sim/sequences", 1);
+        return 0;
+    }
+    if (verb == "key" && w.size() >= 2 && w.size() <= 4 && parse_int(w[1], 0, 0x2ff, code)) line = "input " + join(0);
+    else if (verb == "sw" && w.size() >= 3 && w.size() <= 4 && parse_int(w[1], 0, 0x10, code)) line = "input " + join(0);
+    else if (verb == "touch" && w.size() >= 3 && w.size() <= 4 && parse_int(w[1], -100000, 100000, code) &&
+             parse_int(w[2], -100000, 100000, code))
+        line = "input " + join(0);
+    else if (verb == "send" && w.size() >= 3) line = join(1);
+    else die("bad station command: " + join(0) + "\n" + kUsage);
+    if (!sim::station_send(root, line)) {
+        if (errno == ENXIO)
+            die("no device of the phone in " + root + " is open: nothing reads (is the daemon running, and the test started?)", 1);
+        die("cannot send to " + root + "/station/devices: " + strerror(errno), 1);
+    }
+    return 0;
+}
+
 std::string describe(int status) {
     if (WIFEXITED(status)) return "daemon exited with status " + std::to_string(WEXITSTATUS(status));
     return "daemon killed by signal " + std::to_string(WTERMSIG(status)) + " (" + strsignal(WTERMSIG(status)) + ")";
@@ -432,6 +499,7 @@ bool tcp_waiting(const std::string &root) {
 int main(int argc, char **argv) {
     Options o = parse_args(argc, argv);
     signal(SIGPIPE, SIG_IGN);
+    if (!o.command.empty()) return station_command(o);
 
     // The signals are taken synchronously in the main loop; every thread inherits the mask.
     sigset_t sigs, old_mask;
@@ -482,6 +550,7 @@ int main(int argc, char **argv) {
     say("mode " + mode.name + " (is_uart_flag " + std::to_string(mode.is_uart_flag) + ", is_sp " +
         std::to_string(mode.is_sp) + ")");
 
+    sim::set_root(root);  // the launcher records the restarts in the phone's events.log
     pid_t child = spawn_daemon(daemon, root, o, old_mask);
     bool ready = false;
     int exit_code = 1;
@@ -490,28 +559,51 @@ int main(int argc, char **argv) {
         return std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() - t).count();
     };
     bool stopping = false, killed = false, timed_out = false;
-    std::chrono::steady_clock::time_point stop_at;
+    std::chrono::steady_clock::time_point stop_at, restart_at;
+    int restarts = 0, quick_ends = 0;
     for (;;) {
         struct timespec tick = {0, 50 * 1000 * 1000};
         int sig = sigtimedwait(&sigs, nullptr, &tick);
         if (sig == SIGINT || sig == SIGTERM || sig == SIGHUP) {
+            if (child < 0) {  // between a daemon's end and its restart: nothing left to stop
+                exit_code = sig;
+                break;
+            }
             kill(child, sig);
             if (!stopping) stop_at = std::chrono::steady_clock::now();
             stopping = true;
         }
         int status = 0;
-        if (waitpid(child, &status, WNOHANG) == child) {
+        if (child > 0 && waitpid(child, &status, WNOHANG) == child) {
             say(describe(status));
             if (!ready && !stopping) fprintf(stderr, "ftcmd-sim: the daemon ended before it was ready\n");
             exit_code = timed_out ? 1 : status_code(status);
-            break;
+            if (stopping || !o.restart) break;
+            // Ended on its own: init restarts the service, unless it keeps dying at once.
+            quick_ends = since(start) < kQuickEndMs ? quick_ends + 1 : 0;
+            ++restarts;
+            sim::record("init", "ftcmd: " + describe(status) + "; restart " + std::to_string(restarts));
+            if (quick_ends >= kMaxQuickEnds) {
+                fprintf(stderr, "ftcmd-sim: the daemon ended %d times within %d ms of its start; not restarting it\n",
+                        quick_ends, kQuickEndMs);
+                break;
+            }
+            say("restarting the daemon (restart " + std::to_string(restarts) + ")");
+            sim::write_kv(root + "/.sim/properties", "sys.qrcode.view", nullptr);  // "ready" is told again
+            ready = false;
+            child = -1;
+            restart_at = std::chrono::steady_clock::now() + std::chrono::milliseconds(kRestartDelayMs);
+        }
+        if (child < 0 && std::chrono::steady_clock::now() >= restart_at) {
+            child = spawn_daemon(daemon, root, o, old_mask);
+            start = std::chrono::steady_clock::now();
         }
         if (stopping && !killed && since(stop_at) > kStopGraceMs) {
             fprintf(stderr, "ftcmd-sim: the daemon did not stop; killing it\n");
             kill(child, SIGKILL);
             killed = true;
         }
-        if (!ready && !stopping) {
+        if (child > 0 && !ready && !stopping) {
             if (tcp_waiting(root)) {
                 ready = true;
                 say("ready");

@@ -9,6 +9,7 @@
 #include <cstring>
 
 #include "platform/device.h"
+#include "platform/sim/chardev.h"
 #include "platform/sim/sequence.h"
 #include "platform/sim/sim.h"
 
@@ -18,9 +19,14 @@ std::string path(const char *device_path) { return sim::map(device_path); }
 
 // Every writer of the facade and of the simulated libraries opens through here, so the
 // rule of attribute nodes (one value, replaced by each write) is kept in this one place:
-// an open for writing empties the node and never appends. A read takes the next value
-// of a node that has a sequence.
+// an open for writing empties the node and never appends. A device path with a model
+// behind it (or an attribute node that a model owns, opened for writing) gives a
+// descriptor of that model. A read takes the next value of a node that has a sequence,
+// and sees the effect of every earlier write to an owned node.
 int open(const char *p, int flags, mode_t mode) {
+    sim::settle();
+    int fd = sim::device_open(p, flags);
+    if (fd != -2) return fd;
     if ((flags & O_ACCMODE) == O_RDONLY) sim::sequence_node(p);
     else if (sim::attribute_node(p)) flags = (flags & ~O_APPEND) | O_TRUNC;
     return ::open(path(p).c_str(), flags | O_CLOEXEC, mode);
@@ -29,6 +35,14 @@ int open(const char *p, int flags, mode_t mode) {
 FILE *fopen(const char *p, const char *mode) {
     std::string m = mode ? mode : "";
     bool writes = m.find_first_of("wa+") != std::string::npos;
+    sim::settle();
+    int fd = sim::device_open(p, writes ? (m.find('+') != std::string::npos ? O_RDWR : O_WRONLY) : O_RDONLY);
+    if (fd >= 0) {
+        FILE *f = ::fdopen(fd, m.c_str());
+        if (!f) ::close(fd);
+        return f;
+    }
+    if (fd == -1) return nullptr;
     if (!writes) sim::sequence_node(p);
     else if (sim::attribute_node(p)) m = m.find('+') != std::string::npos ? "w+" : "w";
     m += 'e';
@@ -81,7 +95,10 @@ int write_node(const char *p, const char *text, int flags) {
     int fd = open(p, flags, 0666);
     if (fd < 0) return -1;
     ssize_t n = ::write(fd, text, strlen(text));
+    int err = errno;
     ::close(fd);
+    sim::settle();  // a model that owns the node has taken the write
+    errno = err;
     return static_cast<int>(n);
 }
 
@@ -110,7 +127,11 @@ int gettimeofday(struct timeval *tv) {
 
 void sync() { sim::record("sync", ""); }
 
-int ioctl(int fd, unsigned long request, void *arg) { return ::ioctl(fd, request, arg); }
+int ioctl(int fd, unsigned long request, void *arg) {
+    int result = 0;
+    if (sim::device_ioctl(fd, request, arg, &result)) return result;
+    return ::ioctl(fd, request, arg);
+}
 
 // The simulated phone's memory is the MemTotal of its own proc/meminfo, in 4 KiB pages, so
 // the same command answers the same on every workstation; the processor count is config's

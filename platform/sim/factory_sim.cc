@@ -16,6 +16,7 @@
 #include "platform/android.h"
 #include "platform/device.h"
 #include "platform/factory.h"
+#include "platform/sim/chardev.h"
 #include "platform/sim/script.h"
 #include "platform/sim/sim.h"
 
@@ -71,6 +72,7 @@ int kaelatcmd_write_system_file(const char *path, int flags, const char *text) {
     size_t len = strlen(text);
     ssize_t n = ::write(fd, text, len);
     ::close(fd);
+    sim::settle();
     return n == static_cast<ssize_t>(len) ? 0 : -1;
 }
 
@@ -89,6 +91,7 @@ int kaelatcmd_fwrite_system_file(const char *path, const char *mode, const char 
     size_t len = strlen(text);
     size_t n = fwrite(text, 1, len, f);
     int rc = fclose(f);
+    sim::settle();
     return (n == len && rc == 0) ? 0 : -1;
 }
 
@@ -112,6 +115,7 @@ int write_policy_file(int, const char *path, int flags, const char *text) {
     ssize_t n = ::write(fd, text, len);
     int err = errno;
     ::close(fd);
+    sim::settle();
     if (std::string(path) == "/proc/sysrq-trigger") sim::record("sysrq", text);
     return n < 0 ? -err : 0;
 }

@@ -17,6 +17,7 @@
 #include "platform/device.h"
 #include "platform/factory.h"
 #include "platform/sim/cbuf.h"
+#include "platform/sim/processes.h"
 #include "platform/sim/script.h"
 #include "platform/sim/sim.h"
 
@@ -105,11 +106,7 @@ std::string run_stage(const std::vector<std::string> &w, const std::string &inpu
         return out;
     }
     if (prog == "du" && w.size() >= 2) return disk_usage(w.back());
-    if (prog == "ps") {
-        return "USER           PID  PPID     VSZ    RSS WCHAN            ADDR S NAME\n"
-               "root             1     0 10871512  8968 0                   0 S init\n"
-               "root           612     1 10800160  4436 0                   0 S ftcmd\n";
-    }
+    if (prog == "ps") return sim::process_list();
     if (prog == "bdt" && w.size() >= 2) {
         // The controller's test mode shows in the property that AT+EMBT=4 reads.
         if (w[1] == "entrydut" || w[1] == "txcontinuous") property_set("bluetooth.bdt.kaeldut", "true");

@@ -10,6 +10,7 @@
 #include <stdexcept>
 #include <thread>
 
+#include "platform/sim/chardev.h"
 #include "platform/sim/sequence.h"
 #include "platform/sim/sim.h"
 
@@ -60,6 +61,7 @@ std::string Sandbox::path(const std::string &device_path) const {
 }
 
 std::string Sandbox::read(const std::string &device_path) const {
+    sim::settle();  // writes of this process to a node that a device model owns have landed
     std::ifstream in(path(device_path), std::ios::binary);
     std::ostringstream ss;
     ss << in.rdbuf();

@@ -17,6 +17,7 @@
 #include <thread>
 #include <vector>
 
+#include "platform/device.h"
 #include "tests/support/daemon.h"
 
 namespace fs = std::filesystem;
@@ -346,6 +347,74 @@ TEST(Tools, FreshEmptiesOnlyASandbox) {
     ASSERT_TRUE(sim.ready()) << sim.out;
     EXPECT_FALSE(box.exists("/data/leftover"));
     EXPECT_TRUE(box.exists("/.sim/testapp.replies"));
+}
+
+// ---- supervision and station commands
+
+// A line that ends the daemon: the emergency-call frame has no room for it.
+const std::string kFatalLine = "ATD112;" + std::string(115, 'x');
+
+TEST(Tools, ADaemonThatEndsIsRestartedAndAnswersAgain) {
+    Sandbox box;
+    Launcher sim(box.root);
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "--timeout", "2", kFatalLine});
+    ASSERT_TRUE(sim.wait_for("ftcmd-sim: restarting the daemon (restart 1)\n")) << sim.out;
+    EXPECT_NE(sim.out.find("ftcmd-sim: daemon exited with status 6\n"), std::string::npos) << sim.out;
+    sim.out.clear();
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "AT+QXWLAN"}).out, kNotSupportedBare);
+    EXPECT_NE(box.events().find("init ftcmd: daemon exited with status 6; restart 1\n"), std::string::npos) << box.events();
+    EXPECT_EQ(sim.stop(SIGINT), 2);  // Ctrl-C still ends both
+}
+
+TEST(Tools, NoRestartEndsWithTheDaemonsStatus) {
+    Sandbox box;
+    Launcher sim(box.root, {"--no-restart"});
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "--timeout", "2", kFatalLine});
+    int status = 0;
+    for (int i = 0; i < 200 && waitpid(sim.pid, &status, WNOHANG) == 0; ++i)
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    ASSERT_TRUE(WIFEXITED(status)) << sim.out;
+    EXPECT_EQ(WEXITSTATUS(status), 6);
+    sim.pid = -1;
+    EXPECT_EQ(box.events().find("init "), std::string::npos);
+}
+
+TEST(Tools, SequencesSetFromTheStationChangeAnswersWhileRunning) {
+    Sandbox box;
+    Launcher sim(box.root);
+    ASSERT_TRUE(sim.ready()) << sim.out;
+    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "seq", "testapp:emerg_call", "busy", "ok"}).status, 0);
+    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "ATD112;"}).out, "ATD112;\r\nERROR\r\n");
+    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "ATD112;"}).out, "ATD112;\r\nOK\r\n");
+    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "ATD112;"}).out, "ATD112;\r\nOK\r\n");
+    // The three messages are in the record, in order of time.
+    std::vector<Event> messages;
+    for (const auto &e : box.event_list())
+        if (e.kind == "message") messages.push_back(e);
+    ASSERT_EQ(messages.size(), 3u);
+    EXPECT_EQ(messages[0].detail, "emerg_call -> busy");
+    EXPECT_EQ(messages[2].detail, "emerg_call -> ok");
+    EXPECT_LE(messages[0].ms, messages[1].ms);
+    EXPECT_LE(messages[1].ms, messages[2].ms);
+}
+
+TEST(Tools, StationInjectsKeysIntoAnOpenDevice) {
+    Sandbox box;
+    box.activate();
+    // Nothing reads the input devices: the station is told so.
+    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "key", "115"}).status, 1);
+    int fd = dev::open("/dev/input/event1", O_RDONLY);  // this process stands in for the daemon
+    ASSERT_GE(fd, 0);
+    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "key", "115", "press"}).status, 0);
+    std::string got = read_some(fd, 48, 5000);
+    ASSERT_EQ(got.size(), 48u);
+    EXPECT_EQ(got.substr(16, 8), std::string("\x01\x00\x73\x00\x01\x00\x00\x00", 8));  // EV_KEY 115 pressed
+    EXPECT_EQ(got.substr(40, 8), std::string(8, '\0'));                                     // the report
+    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "key", "volume"}).status, 2);  // not a key code
+    close(fd);
 }
 
 }  // namespace
