@@ -27,11 +27,15 @@ namespace sim {
 
 // The device models, one file each. A new model adds its line here.
 extern const DeviceModel kInputEventModel;
+extern const DeviceModel kChargerMcuModel;
+extern const DeviceModel kPmicRegmapModel;
 
 namespace {
 
 const DeviceModel *const kModels[] = {
     &kInputEventModel,
+    &kChargerMcuModel,
+    &kPmicRegmapModel,
 };
 
 struct Session {

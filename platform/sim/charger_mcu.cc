@@ -4,12 +4,14 @@
 // loop. The controller then reports through "chg_enable" and "dchg_state".
 // The model keeps only what the station can see: the decoded record in events.log, the
 // switch reflected in chg_enable ("1"/"0") and dchg_state ("dchg_running"/"dchg_stop"),
-// and the parameters in .sim/charger (param_a, param_b, param_c). It does not model the
-// firmware, its update, or any effect of the parameters on the readings.
+// and the parameters in .sim/charger (param_a, param_b, param_c). It owns "burn_ctl", so
+// every write() of the daemon reaches it as one record. It does not model the firmware,
+// its update, or any effect of the parameters on the readings.
 #include <cstdio>
 #include <string>
 
 #include "platform/charger_control.h"
+#include "platform/sim/chardev.h"
 #include "platform/sim/power_models.h"
 #include "platform/sim/sim.h"
 
@@ -60,4 +62,19 @@ bool charger_mcu_write(const uint8_t *data, size_t n) {
     return true;
 }
 
+}  // namespace sim
+
+namespace {
+
+bool owns_control_node(const std::string &path) { return path == "/sys/kernel/debug/stm32l011/burn_ctl"; }
+
+void take_record(const std::string &, const std::string &data) {
+    sim::charger_mcu_write(reinterpret_cast<const uint8_t *>(data.data()), data.size());
+}
+
+}  // namespace
+
+namespace sim {
+extern const DeviceModel kChargerMcuModel = {
+    .name = "charger", .owns = owns_control_node, .node_write = take_record};
 }  // namespace sim

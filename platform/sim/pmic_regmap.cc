@@ -3,11 +3,13 @@
 // then reads "data": one "addr: value" line per register, in hexadecimal.
 // The model answers from a register table, .sim/pmic_registers ("0x305e=0x80" lines); a
 // register that the table does not list reads 00. It does not model register writes, the
-// other regmap files, or the PMIC's behaviour behind the registers.
+// other regmap files, or the PMIC's behaviour behind the registers. It owns "count" and
+// "address": each write is kept as the node's text and "data" is made afresh from both.
 #include <cstdio>
 #include <cstdlib>
 #include <string>
 
+#include "platform/sim/chardev.h"
 #include "platform/sim/power_models.h"
 #include "platform/sim/sim.h"
 
@@ -43,4 +45,27 @@ std::string pmic_regmap_data(const std::string &count_text, const std::string &a
     return out;
 }
 
+}  // namespace sim
+
+namespace {
+
+constexpr char kRegmap[] = "/d/regmap/spmi0-00/";
+
+std::string regmap_node(const char *name) { return sim::map((std::string(kRegmap) + name).c_str()); }
+
+bool owns_selector(const std::string &path) { return path == std::string(kRegmap) + "count" || path == std::string(kRegmap) + "address"; }
+
+void select_registers(const std::string &path, const std::string &text) {
+    sim::write_file_atomic(sim::map(path.c_str()), text);
+    std::string count, address;
+    sim::read_file(regmap_node("count"), count);
+    sim::read_file(regmap_node("address"), address);
+    sim::write_file_atomic(regmap_node("data"), sim::pmic_regmap_data(count, address));
+}
+
+}  // namespace
+
+namespace sim {
+extern const DeviceModel kPmicRegmapModel = {
+    .name = "pmic", .owns = owns_selector, .node_write = select_registers};
 }  // namespace sim

@@ -168,7 +168,10 @@ INSTANTIATE_TEST_SUITE_P(OneShot, AdcLine, ::testing::Values(
          .after = {{kRegmap + "count", "1"}, {kRegmap + "address", "0x305e"}}},
     Case{.line = "AT+QX_ADC_REG=1", .tag = "NoCount", .given = {{kRegmap + "count", ""}},
          .body = "\"write /d/regmap/spmi0-00/count error:No such file or directory\"", .word = "ATNG"},
-    Case{.line = "AT+QX_ADC_REG=1", .tag = "NoData", .given = {{kRegmap + "data", ""}}, .word = "ATNG"},
+    Case{.line = "AT+QX_ADC_REG=1", .tag = "DataUnreadable", .given = {{kRegmap + "data", ""}, {kRegmap + "data/x", "x"}},
+         .word = "ATNG"},
+    Case{.line = "AT+QX_ADC_REG=1", .tag = "TableEdited", .given = {{"/.sim/pmic_registers", "0x305e=0x3c\n"}},
+         .body = "\r\n\"305e: 3c\n\"\r\n", .word = "ATOK"},
     Case{.line = "AT+QX_ADC_REG=0", .tag = "", .word = "ATERROR", .after = {{kRegmap + "address", "0x305e\n"}}}),
     name_of);
 

@@ -119,10 +119,11 @@ INSTANTIATE_TEST_SUITE_P(ChargerController, PowerFamily, ::testing::Values(
     Case{.line = "AT+QXCHARGE=1,5,7", .tag = "StateUnknown", .given = {{kMcu + "chg_enable", "on\n"}},
          .body = "\r\n\"state:exception\"\r\n", .word = "ERROR", .after = {{kBurn, ""}}},
     Case{.line = "AT+QXCHARGE=1,5,-7", .tag = "", .word = "OK",
-         .after = {{kBurn, bytes({0xC1, 5, 0, 0, 0, 0xC2, 0xF9, 0xFF, 0xFF, 0xFF})}}},
+         .events = "charger param_a 5\ncharger param_b -7\n", .after = {{"/.sim/charger", "param_a=5\nparam_b=-7\n"}}},
     Case{.line = "AT+QXCHARGE=2,1", .tag = "", .given = {{kMcu + "chg_enable", "0\n"}}, .word = "OK",
-         .after = {{kBurn, bytes({0xC0, 1})}}},
-    Case{.line = "AT+QXCHARGE=2,0", .tag = "", .word = "OK", .after = {{kBurn, bytes({0xC0, 0})}}},
+         .events = "charger switch on\n", .after = {{kMcu + "chg_enable", "1\n"}, {kMcu + "dchg_state", "dchg_running\n"}}},
+    Case{.line = "AT+QXCHARGE=2,0", .tag = "", .word = "OK", .events = "charger switch off\n",
+         .after = {{kMcu + "chg_enable", "0\n"}, {kMcu + "dchg_state", "dchg_stop\n"}}},
     Case{.line = "AT+QXCHARGE=2,1", .tag = "NoController", .setup = no_mcu, .word = "ERROR"},
     Case{.line = "AT+QXCHARGE=2,2", .tag = "", .body = "\"1,dchg_running\n\"", .word = "ATOK", .after = kMcuUntouched},
     Case{.line = "AT+QXCHARGE=2,2", .tag = "NoStateNode", .given = {{kMcu + "chg_enable", ""}}, .word = "ATNG"},
@@ -137,7 +138,7 @@ INSTANTIATE_TEST_SUITE_P(ChargerController, PowerFamily, ::testing::Values(
     Case{.line = "AT+QXCHARGE=3,0", .tag = "Empty", .given = {{kMcu + "out_version", "x"}},
          .setup = [](const Sandbox &b) { b.write(kMcu + "out_version", ""); }, .word = "ERROR"},
     Case{.line = "AT+QXCHARGE=3,2", .tag = "", .word = "ERROR"},
-    Case{.line = "AT+QXCHARGE=4,-1", .tag = "", .word = "OK", .after = {{kBurn, bytes({0xC3, 0xFF, 0xFF, 0xFF, 0xFF})}}},
+    Case{.line = "AT+QXCHARGE=4,-1", .tag = "", .word = "OK", .events = "charger param_c -1\n"},
     Case{.line = "AT+QXCHARGE=4", .tag = "NoValue", .word = "ERROR", .after = {{kBurn, ""}}},
     Case{.line = "AT+QXCHARGE=5", .tag = "", .word = "ERROR"}),
     name_of);
@@ -398,6 +399,15 @@ TEST(PowerDaemon, AveragingBlocksEveryOtherChannel) {
     EXPECT_EQ(read_some(tcp, frame.size()), frame);
     close(local);
     close(tcp);
+}
+
+TEST_F(PowerBase, ControllerSwitchedOffReportsItAndRefusesParameters) {
+    EXPECT_EQ(serve("AT+QXCHARGE=2,0", SRC_TCP, 21), "AT+QXCHARGE=2,0\r\n\r\nOK\r\n");
+    const std::string state = "AT+QXCHARGE=2,2\r\n\"0,dchg_stop\n\"\r\nATOK\r\n";
+    EXPECT_EQ(serve("AT+QXCHARGE=2,2", SRC_TCP, state.size()), state);
+    const std::string refused = "AT+QXCHARGE=1,5,7\r\n\r\n\"state:discharge\"\r\n\r\nERROR\r\n";
+    EXPECT_EQ(serve("AT+QXCHARGE=1,5,7", SRC_TCP, refused.size()), refused);
+    EXPECT_EQ(box.events(), "charger switch off\n");
 }
 
 struct RecordCase {
