@@ -97,8 +97,7 @@ bool send_records(std::initializer_list<charger::Record> records) {
     return true;
 }
 
-// The second ","-field of the line (the first after the form), or nullptr; the line is
-// cut in place.
+// The ","-field n of the line (0 is the form itself), or nullptr; the line is cut in place.
 char *nth_field(char *cmd, int n) {
     char *save = nullptr;
     char *field = strtok_r(cmd, ",", &save);
