@@ -20,6 +20,10 @@ constexpr size_t kAssemblyAtMode = 488;
 constexpr size_t kDefaultAtMode = 664;    // one character
 constexpr size_t kFirstBootDone = 688;
 constexpr size_t kDpdtService = 104;      // 1 asks the DPDT service to run; the debug-port close clears it
+constexpr size_t kGsensorCalFlag = 0;     // 1 after a good accelerometer calibration
+constexpr size_t kGsensorCalOffsets = 76; // accelerometer offsets x, y, z (three s32)
+constexpr size_t kGyroCalFlag = 120;      // 1 after a good gyroscope calibration
+constexpr size_t kGyroCalOffsets = 124;   // gyroscope offsets x, y, z (three s32)
 constexpr size_t kEadcWord = 460;         // signed word answered by AT+EADC=6
 
 struct Record {

@@ -3,6 +3,7 @@
 #include <pthread.h>
 #include <unistd.h>
 
+#include "core/port_state.h"
 #include "platform/android.h"
 #include "platform/device.h"
 #include "platform/factory.h"
@@ -14,6 +15,11 @@ int g_lights_run = 0;
 int start_worker(void *(*fn)(void *), void *arg) {
     pthread_t tid;
     return pthread_create(&tid, nullptr, fn, arg);
+}
+
+void wait_for_current_answer() {
+    pthread_mutex_lock(&g_port.mutex);
+    pthread_mutex_unlock(&g_port.mutex);
 }
 
 void *reboot_thread(void *reason) {

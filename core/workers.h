@@ -5,6 +5,11 @@
 // Returns pthread_create's result (0 on success).
 int start_worker(void *(*fn)(void *), void *arg);
 
+// A worker that writes frames to the station calls this before its first one: the
+// dispatcher holds its mutex until the answer of the line that started the worker has
+// left, so the station always sees that answer first.
+void wait_for_current_answer();
+
 // Restarts the device two seconds after the answer has left; arg is a reason text or null.
 void *reboot_thread(void *reason);
 

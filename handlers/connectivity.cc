@@ -209,6 +209,7 @@ bool gps_request(int option, char *reply) {
 
 void *update_gps_value_thread(void *arg) {
     const unsigned generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
+    wait_for_current_answer();
     while (g_gps_streaming && g_gps_generation == generation) {
         char reply[kGpsReplySize] = {};
         bool sent = gps_request(2, reply);

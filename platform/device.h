@@ -18,6 +18,8 @@ namespace dev {
 // Device path (absolute, or relative to "/" where the daemon runs) to the path opened.
 std::string path(const char *device_path);
 
+// open(): attribute nodes (sysfs, procfs, debugfs) hold one value that each write replaces;
+// a character device gives a descriptor that read, write, select, poll and epoll serve.
 int open(const char *path, int flags, mode_t mode = 0);
 FILE *fopen(const char *path, const char *mode);
 bool exists(const char *path);
@@ -37,7 +39,7 @@ int set_clock(const struct timeval *tv);  // settimeofday()
 time_t now();
 int gettimeofday(struct timeval *tv);
 void sync();
-int ioctl(int fd, unsigned long request, void *arg);
+int ioctl(int fd, unsigned long request, void *arg);  // reaches the device behind fd
 // sysconf(): the phone's own figures (_SC_PHYS_PAGES, _SC_PAGESIZE, _SC_NPROCESSORS_CONF...).
 long sysconf(int name);
 

@@ -22,3 +22,10 @@ long kael_sensor_factory_test(int test, SensorTestResult *result, int arg1, int 
 void show_sensor_test_result(const SensorTestResult *result);
 
 }  // extern "C"
+
+// Word numbers of the record as the handlers name them. Word 0 is success; words 1 to 28
+// live in value[] one place lower, and sensor_word() is the only place that knows it.
+enum SensorWord : int { kSensorX = 1, kSensorY = 2, kSensorZ = 3 };
+
+inline float sensor_word(const SensorTestResult &r, int word) { return r.value[word - 1]; }
+inline void set_sensor_word(SensorTestResult &r, int word, float v) { r.value[word - 1] = v; }

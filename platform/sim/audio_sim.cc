@@ -1,15 +1,20 @@
 // The audio factory-test library on the simulated phone. Results come from the
 // key=value script <root>/.sim/audio (a call's name, or "ftm.<case>" for a numbered test
-// case, gives its return value; unlisted calls succeed); the fault "audio" fails every
-// path call. Every call is recorded as "audio <call>(<args>) -> <result>". The recorder
-// cases leave a short silent WAV file where the phone's recorder would write its take.
+// case, gives its return value; "ftm.<case>.stop" overrides it for stopping the case;
+// unlisted calls succeed). The fault "audio" fails every path call, "smartpa" takes the
+// amplifier off its bus and "mbhc" silences the headset detection. Every call is recorded
+// as "audio <call>(<args>) -> <result>"; the recording cases drive the recorder model
+// (audio_recorder.cc).
+#include <chrono>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
-#include <filesystem>
 #include <string>
+#include <thread>
 
 #include "platform/audio.h"
 #include "platform/device.h"
+#include "platform/sim/audio_recorder.h"
 #include "platform/sim/script.h"
 #include "platform/sim/sim.h"
 
@@ -25,37 +30,24 @@ int path_call(const char *name, const std::string &args) {
 
 std::string num(int n) { return std::to_string(n); }
 
-// 44-byte header of an empty 16-bit mono 48 kHz WAV file.
-std::string empty_wav() {
-    auto le32 = [](unsigned v) { return std::string{char(v), char(v >> 8), char(v >> 16), char(v >> 24)}; };
-    auto le16 = [](unsigned v) { return std::string{char(v), char(v >> 8)}; };
-    return "RIFF" + le32(36) + "WAVEfmt " + le32(16) + le16(1) + le16(1) + le32(48000) + le32(96000) + le16(2) + le16(16) +
-           "data" + le32(0);
-}
-
-const char *record_file(int test_case) {
-    switch (test_case) {
-        case 51: return "/sdcard/engineermode/main-record.wav";
-        case 52: return "/sdcard/engineermode/sub-record.wav";
-        case 53: return "/sdcard/engineermode/smart-record.wav";
-        case 54: return "/sdcard/engineermode/hp-record.wav";
-        case 55: return "/sdcard/engineermode/double-record.wav";
-        default: return nullptr;
-    }
-}
+// The amplifier does not answer on its bus: the fault "smartpa", or "audio" for all parts.
+bool amplifier_absent() { return sim::fault("audio") || sim::fault("smartpa"); }
 
 int ftm(const char *name, int test_case, int enable, int volume, const char *path) {
     std::string args = num(test_case) + "," + num(enable) + "," + num(volume) + (path ? std::string(",") + path : "");
     std::string key = "ftm." + num(test_case);
-    int rc = sim::fault("audio") ? -1 : static_cast<int>(scripted(key.c_str(), 0));
+    // One script read per call, so a sequence of results advances once per call.
+    std::string stop = enable ? "" : sim::script_text(sim::state("audio"), key + ".stop", "");
+    long scripted_rc = stop.empty() ? scripted(key.c_str(), 0) : strtol(stop.c_str(), nullptr, 10);
+    int rc = sim::fault("audio") ? -1 : static_cast<int>(scripted_rc);
     if (rc == 0 && enable && path && *path && !dev::exists(path)) rc = 2;  // nothing to play
-    if (rc == 0 && enable && record_file(test_case)) {
-        std::string file = sim::map(record_file(test_case));
-        std::error_code ec;
-        std::filesystem::create_directories(std::filesystem::path(file).parent_path(), ec);
-        sim::write_file_atomic(file, empty_wav());
-    }
     sim::record("audio", std::string(name) + "(" + args + ") -> " + num(rc));
+    if (rc == 0 && sim::recorder_file(test_case)) {
+        if (enable)
+            sim::recorder_start(test_case);
+        else
+            sim::recorder_stop(test_case);
+    }
     return rc;
 }
 
@@ -105,35 +97,44 @@ int audio_ftm_process_full(int test_case, int enable, int volume, const char *pa
 }
 
 int ftm_mbhc_get_hp_type(void) {
-    int type = static_cast<int>(scripted("hp_type", 1));
+    int type = sim::fault("mbhc") ? -1 : static_cast<int>(scripted("hp_type", 1));
     sim::record("audio", "ftm_mbhc_get_hp_type() -> " + num(type));
     return type;
 }
 
 int ftm_mbhc_mos_test(void) {
-    int rc = sim::fault("audio") ? -1 : static_cast<int>(scripted("mos_test", 1));
+    int rc = sim::fault("audio") || sim::fault("mbhc") ? -1 : static_cast<int>(scripted("mos_test", 1));
     sim::record("audio", "ftm_mbhc_mos_test() -> " + num(rc));
     return rc;
 }
 
-int get_smartpa_manufacturer(void) { return static_cast<int>(scripted("smartpa_manufacturer", 0)); }
+int get_smartpa_manufacturer(void) {
+    int maker = amplifier_absent() ? -1 : static_cast<int>(scripted("smartpa_manufacturer", 0));
+    sim::record("audio", "get_smartpa_manufacturer() -> " + num(maker));
+    return maker;
+}
 
+// A calibration plays its tone for smartpa_calibrate_ms before the result is known.
 int smartpa_calibrate(char *text, int len) {
-    int rc = sim::fault("audio") ? -1 : static_cast<int>(scripted("smartpa_calibrate", 0));
-    std::string result = sim::script_text(sim::state("audio"), "smartpa_calibrate_text", rc == 0 ? "calibrate ok" : "calibrate fail");
+    long ms = scripted("smartpa_calibrate_ms", 0);
+    if (ms > 0 && !amplifier_absent()) std::this_thread::sleep_for(std::chrono::milliseconds(ms < 60000 ? ms : 60000));
+    int rc = amplifier_absent() ? -1 : static_cast<int>(scripted("smartpa_calibrate", 0));
+    const char *plain = rc == 0 ? "calibrate ok" : "calibrate fail";
+    std::string result = amplifier_absent() ? "smartpa not found"
+                                            : sim::script_text(sim::state("audio"), "smartpa_calibrate_text", plain);
     if (text && len > 0) snprintf(text, static_cast<size_t>(len), "%s", result.c_str());
     sim::record("audio", "smartpa_calibrate() -> " + num(rc));
     return rc;
 }
 
 int smartpa_check_mtpex(void) {
-    int rc = sim::fault("audio") ? -1 : static_cast<int>(scripted("smartpa_mtpex", 1));
+    int rc = amplifier_absent() ? -1 : static_cast<int>(scripted("smartpa_mtpex", 1));
     sim::record("audio", "smartpa_check_mtpex() -> " + num(rc));
     return rc;
 }
 
 int smartpa_reset_mtpex(void) {
-    int rc = sim::fault("audio") ? -1 : static_cast<int>(scripted("smartpa_reset_mtpex", 0));
+    int rc = amplifier_absent() ? -1 : static_cast<int>(scripted("smartpa_reset_mtpex", 0));
     sim::record("audio", "smartpa_reset_mtpex() -> " + num(rc));
     return rc;
 }

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
@@ -186,14 +187,16 @@ bool read_file(const std::string &host_path, std::string &out) {
 }
 
 bool write_file_atomic(const std::string &host_path, const std::string &data) {
-    std::string tmp = host_path + ".tmp." + std::to_string(getpid());
-    {
-        std::ofstream out(tmp, std::ios::binary | std::ios::trunc);
-        if (!out) return false;
-        out << data;
-        if (!out) return false;
-    }
-    return ::rename(tmp.c_str(), host_path.c_str()) == 0;
+    // Unique per writer, threads included: two writers never share a temp file.
+    static std::atomic<unsigned> serial{0};
+    std::string tmp = host_path + ".tmp." + std::to_string(getpid()) + "." + std::to_string(serial++);
+    std::ofstream out(tmp, std::ios::binary | std::ios::trunc);
+    if (!out) return false;
+    out << data;
+    out.close();
+    bool ok = !out.fail() && ::rename(tmp.c_str(), host_path.c_str()) == 0;
+    if (!ok) ::unlink(tmp.c_str());
+    return ok;
 }
 
 std::vector<std::string> read_lines(const std::string &host_path) {
