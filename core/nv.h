@@ -29,6 +29,7 @@ constexpr size_t kSpecialProduct = 328;     // bit set; kSecondScreenOff: AT+SEC
 constexpr uint32_t kSecondScreenOff = 0x40;
 constexpr size_t kMainPanelColour = 516;    // calibrated colour 0xRRGGBB, restored by AT+LCMT=1
 constexpr size_t kBackPanelColour = 520;    // the same for the back panel, AT+LCMT_BACK=1
+constexpr size_t kEadcWord = 460;         // signed word answered by AT+EADC=6
 
 struct Record {
     unsigned char bytes[PYXA_NV_SIZE] = {};

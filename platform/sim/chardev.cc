@@ -31,6 +31,8 @@ extern const DeviceModel kSideKeyModel;
 extern const DeviceModel kFlashLedModel;
 extern const DeviceModel kNfcControllerModel;
 extern const DeviceModel kLcmPanelModel;
+extern const DeviceModel kChargerMcuModel;
+extern const DeviceModel kPmicRegmapModel;
 
 namespace {
 
@@ -40,6 +42,8 @@ const DeviceModel *const kModels[] = {
     &kFlashLedModel,
     &kNfcControllerModel,
     &kLcmPanelModel,
+    &kChargerMcuModel,
+    &kPmicRegmapModel,
 };
 
 struct Session {
