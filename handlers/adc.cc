@@ -76,13 +76,6 @@ constexpr CoreLimit kCoreLimits[] = {
     {"/sys/devices/system/cpu/cpu0/core_ctl/min_cpus", 1, 1},
 };
 
-// A worker's first line must not overtake the answer of the command that started it: the
-// answer leaves while the dispatch mutex is held, so waiting for the mutex once is enough.
-void wait_for_start_answer() {
-    pthread_mutex_lock(&g_port.mutex);
-    pthread_mutex_unlock(&g_port.mutex);
-}
-
 // Counted from the start, not from when the thread first runs, so that a stop right after
 // a start never sees "no worker" while one is about to run.
 int start_sampling(void *(*fn)(void *), void *arg) {
@@ -167,7 +160,7 @@ void *eadc_thread(void *) {
     EM_LOGI("Start");
     keep_charge_level("100");
     if (!is_sp) limit_cores();
-    wait_for_start_answer();
+    wait_for_current_answer();
     while (g_eadc_run == 1) {
         if (!eadc_sample()) break;
         usleep(kEadcPeriod);
@@ -183,7 +176,7 @@ void *eadc_thread(void *) {
 void *batadc_thread(void *) {
     WorkerLife life;
     EM_LOGI("Start");
-    wait_for_start_answer();
+    wait_for_current_answer();
     while (g_batadc_run == 1) {
         int millivolts = 0;
         // A missing node ends the stream but leaves the flag set: the station must stop it
