@@ -11,6 +11,7 @@
 
 #include "handlers/audio.h"
 #include "platform/sim/sim.h"
+#include "tests/support/checks.h"
 #include "tests/support/in_process.h"
 
 namespace {
@@ -21,9 +22,7 @@ const char *kMainBusy = "sys.is_audio_working.main_mic";
 const char *kSubBusy = "sys.is_audio_working.sub_mic";
 
 std::string nv_pattern() {  // every byte non-zero, so a stray write shows
-    std::string nv(1012, '\0');
-    for (size_t i = 0; i < nv.size(); ++i) nv[i] = static_cast<char>(0x21 + i % 181);
-    return nv;
+    return nv_fill(0x21, 181);
 }
 
 // The audio library's calls recorded in events.log, in order, without their kind.
@@ -47,14 +46,6 @@ long long event_ms(const Sandbox &box, const std::string &kind, const std::strin
     return -1;
 }
 
-void expect_in_order(const std::string &log, const std::vector<std::string> &texts) {
-    size_t at = 0;
-    for (const auto &t : texts) {
-        size_t pos = log.find(t, at);
-        ASSERT_NE(pos, std::string::npos) << "missing in order: " << t << "\n" << log;
-        at = pos + t.size();
-    }
-}
 
 // Sets one key of the audio library's script ("ftm.22=-5").
 void script(const Sandbox &b, const std::string &line) {

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "platform/sim/sim.h"
+#include "tests/support/checks.h"
 #include "tests/support/in_process.h"
 
 namespace {
@@ -24,19 +25,9 @@ const std::string kManyParams = repeat(",77", 600);
 const std::string kBackStart = "camera start#cameraId back#eng_AT_command true -> success";
 
 std::string nv_pattern() {  // every byte non-zero, so a stray write shows
-    std::string nv(1012, '\0');
-    for (size_t i = 0; i < nv.size(); ++i) nv[i] = static_cast<char>(0x21 + i % 91);
-    return nv;
+    return nv_fill(0x21, 91);
 }
 
-void expect_in_order(const std::string &log, const std::vector<std::string> &texts) {
-    size_t at = 0;
-    for (const auto &t : texts) {
-        size_t pos = log.find(t, at);
-        ASSERT_NE(pos, std::string::npos) << "missing in order: " << t << "\n" << log;
-        at = pos + t.size();
-    }
-}
 
 void config(const Sandbox &b, const std::string &key, const std::string &value) {
     sim::write_kv(b.root + "/.sim/config", key, &value);

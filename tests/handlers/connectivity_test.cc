@@ -7,6 +7,7 @@
 #include <thread>
 
 #include "handlers/connectivity.h"
+#include "tests/support/checks.h"
 #include "tests/support/daemon.h"
 #include "tests/support/in_process.h"
 
@@ -19,9 +20,6 @@ const char *kMacFallback = "/mnt/vendor/persist/wlan_mac.bin";
 std::string mac_lines(const std::string &mac, const std::string &second) {
     return "Intf0MacAddress=" + mac + "\nIntf1MacAddress=" + second + "\nIntf2MacAddress=" + mac + "\nIntf3MacAddress=" + mac +
            "\n";
-}
-std::string frame(const std::string &line, const std::string &body, const std::string &word) {
-    return line + "\r\n" + body + "\r\n" + word + "\r\n";
 }
 void prepend(const Sandbox &b, const std::string &file, const std::string &line) {
     b.write(file, line + "\n" + b.read(file));
@@ -41,14 +39,6 @@ struct Case {
 
 std::string case_name(const ::testing::TestParamInfo<Case> &info) { return info.param.name; }
 
-void expect_in_order(const std::string &log, const std::vector<std::string> &texts) {
-    size_t at = 0;
-    for (const auto &t : texts) {
-        size_t pos = log.find(t, at);
-        ASSERT_NE(pos, std::string::npos) << "missing in order: " << t << "\n" << log;
-        at = pos + t.size();
-    }
-}
 
 class Wireless : public InProcess {
 protected:

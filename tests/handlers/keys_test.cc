@@ -9,14 +9,12 @@
 
 #include "core/input_events.h"
 #include "platform/sim/chardev.h"
+#include "tests/support/checks.h"
 #include "tests/support/daemon.h"
 #include "tests/support/in_process.h"
 
 namespace {
 
-std::string frame(const std::string &line, const std::string &body, const std::string &word) {
-    return line + "\r\n" + body + "\r\n" + word + "\r\n";
-}
 
 class Keys : public InProcess {
 protected:

@@ -2,14 +2,13 @@
 // the modem's reply becomes the answer (OK/ERROR, ATOK/ATNG/ATERROR, quoted values).
 #include <sstream>
 
+#include "tests/support/checks.h"
 #include "tests/support/in_process.h"
 
 namespace {
 
 std::string nv_pattern() {  // every byte non-zero, so a stray write shows
-    std::string nv(1012, '\0');
-    for (size_t i = 0; i < nv.size(); ++i) nv[i] = static_cast<char>(0x21 + i % 191);
-    return nv;
+    return nv_fill(0x21, 191);
 }
 std::string with_i32(std::string nv, size_t off, int32_t v) { return nv.replace(off, 4, reinterpret_cast<const char *>(&v), 4); }
 

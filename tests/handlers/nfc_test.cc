@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "platform/sim/chardev.h"
+#include "tests/support/checks.h"
 #include "tests/support/daemon.h"
 #include "tests/support/in_process.h"
 
@@ -32,9 +33,6 @@ const Lines kV10 = {kReset, kInit10, kActivate}, kV20 = {kReset, kInit20, kActiv
 const Lines kTagRead = {kPollMode, kDiscover}, kCard = {kPollMode, kListen1, kListen2, kDiscover};
 const Lines kSelfTest = {kSwpEnable, kSwpTest};
 
-std::string frame(const std::string &line, const std::string &body, const std::string &word) {
-    return line + "\r\n" + body + "\r\n" + word + "\r\n";
-}
 std::string quoted(const std::string &v) { return "\r\n\"" + v + "\"\r\n"; }
 
 // The controller script: these lines go first, and the first line of a key wins.

@@ -8,6 +8,7 @@
 #include <sys/socket.h>
 
 #include "core/nv.h"
+#include "tests/support/checks.h"
 #include "tests/support/daemon.h"
 #include "tests/support/in_process.h"
 
@@ -39,14 +40,6 @@ size_t count(const std::string &text, const std::string &what) {
     size_t n = 0;
     for (size_t at = text.find(what); at != std::string::npos; at = text.find(what, at + 1)) ++n;
     return n;
-}
-void expect_in_order(const std::string &log, const std::vector<std::string> &texts) {
-    size_t at = 0;
-    for (const auto &t : texts) {
-        size_t pos = log.find(t, at);
-        ASSERT_NE(pos, std::string::npos) << "missing in order: " << t << "\n" << log;
-        at = pos + t.size();
-    }
 }
 
 using Setup = std::function<void(const Sandbox &)>;

@@ -8,6 +8,7 @@
 
 #include "core/port_state.h"
 #include "handlers/storage.h"
+#include "tests/support/checks.h"
 #include "tests/support/in_process.h"
 
 namespace {
@@ -26,17 +27,7 @@ const std::string kMounts =
     "/dev/root / ext4 ro,seclabel,relatime 0 0\n/dev/block/dm-5 /data f2fs rw,lazytime 0 0\n";
 
 std::string nv_pattern() {  // every byte non-zero: no storage command may touch the record
-    std::string nv(1012, '\0');
-    for (size_t i = 0; i < nv.size(); ++i) nv[i] = static_cast<char>(0x21 + i % 197);
-    return nv;
-}
-void expect_in_order(const std::string &log, const std::vector<std::string> &texts) {
-    size_t at = 0;
-    for (const auto &t : texts) {
-        size_t pos = log.find(t, at);
-        ASSERT_NE(pos, std::string::npos) << "missing in order: " << t << "\n" << log;
-        at = pos + t.size();
-    }
+    return nv_fill(0x21, 197);
 }
 
 using Setup = void (*)(const Sandbox &);

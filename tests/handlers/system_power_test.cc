@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <thread>
 
+#include "tests/support/checks.h"
 #include "tests/support/in_process.h"
 #include "tests/support/test_name.h"
 
@@ -20,22 +21,12 @@ const std::string kFastStop = "broadcast  com.android.phone.fastSearchNet.FastSe
 const std::string kLong(130, 'x');
 
 std::string nv_pattern() {  // every byte non-zero, so a cleared or a stray field shows
-    std::string nv(1012, '\0');
-    for (size_t i = 0; i < nv.size(); ++i) nv[i] = static_cast<char>(0x11 + i % 199);
-    return nv;
+    return nv_fill(0x11, 199);
 }
 bool close_clears(size_t i) {
     for (size_t off : {12, 100, 104, 396, 488, 496, 688})
         if (i >= off && i < off + 4) return true;
     return false;
-}
-void expect_in_order(const std::string &log, const std::vector<std::string> &texts) {
-    size_t at = 0;
-    for (const auto &t : texts) {
-        size_t pos = log.find(t, at);
-        ASSERT_NE(pos, std::string::npos) << "missing in order: " << t << "\n" << log;
-        at = pos + t.size();
-    }
 }
 
 using Setup = void (*)(const Sandbox &);
