@@ -1,7 +1,9 @@
 // Vibrator and indicator lights: the vibrator pulse and instant vibration, the touch-key
-// backlight, the panels' full-brightness test, the notification LEDs and their blink.
+// backlight, the panels' full-brightness test, the notification LEDs and their blink,
+// the LED ring's effects, haptic feedback and the first-boot setup language.
 #include "handlers/lights.h"
 
+#include <fcntl.h>
 #include <pthread.h>
 #include <unistd.h>
 
@@ -16,6 +18,7 @@
 #include "core/workers.h"
 #include "handlers/common.h"
 #include "handlers/display.h"
+#include "platform/android.h"
 #include "platform/device.h"
 #include "platform/factory.h"
 #include "platform/log.h"
@@ -37,6 +40,9 @@ constexpr char kLcmTest[] = "com.pyxa.engineermode/.ATLcmTest";
 constexpr char kLcmAction[] = "android.factorytest.ATLCM";
 constexpr char kRed[] = "sys/class/leds/red/brightness";
 constexpr char kBlue[] = "sys/class/leds/blue/brightness";
+constexpr char kRingEffect[] = "/sys/class/leds/aw22xxx_led/effect";
+constexpr char kRingCfg[] = "/sys/class/leds/aw22xxx_led/cfg";
+constexpr char kTestInfo[] = "/cache/recovery/last_test_info";
 constexpr char kAirplaneFailed[] = "\r\nexit airplane mode failed\r\n";
 // The instant vibration ends after 20 s anyway: longer times only keep the worker asleep.
 constexpr long long kMaxVibrateMs = 20000;
@@ -300,8 +306,45 @@ int indicatelights_test_handler(char *cmd, int, char *) {
     return invalid_command(cmd);
 }
 
+int set_breath_light_handler(char *cmd, int, char *resp) {
+    if (!line_starts(cmd, "AT+QX_BREATH_LGT=1", 18)) return RC_ATERROR;
+    const char *comma = strchr(cmd, ',');
+    if (comma == nullptr || comma[1] == '\0') return RC_ATERROR;
+    const char *effect = nullptr;
+    switch (comma[1]) {
+        case '0': effect = "0"; break;
+        case 'B': effect = "32"; break;
+        case 'G': effect = "31"; break;
+        case 'H': effect = "2f"; break;
+        case 'R': effect = "30"; break;
+        default:
+            body_printf(resp, "\r\n\"param 2 error\"\r\n");
+            return RC_ATERROR;
+    }
+    if (write_policy_file(0, kRingEffect, O_RDWR, effect) < 0) return RC_ATNG;
+    // A driver that takes the effect but not its start has not shown it: that fails too.
+    if (write_policy_file(0, kRingCfg, O_RDWR, "1") < 0) return RC_ATNG;
+    return RC_ATOK;
+}
+
+int haptic_feedback_handler(char *cmd, int, char *resp) {
+    if (line_is(cmd, "AT+QXCGFK=1")) return test_app_ok("feedback 1") ? RC_OK : RC_ERROR;
+    if (line_is(cmd, "AT+QXCGFK=0")) return test_app_ok("feedback 0") ? RC_OK : RC_ERROR;
+    if (line_is(cmd, "AT+QXCGFK=2")) {
+        const char *reply = ask_test_app("feedback 2");
+        if (reply == nullptr) return RC_ERROR;
+        if (strcmp(reply, "ok 1") == 0) return quote_body(resp, "1"), RC_OK;
+        if (strcmp(reply, "ok 0") == 0) return quote_body(resp, "0"), RC_OK;
+        return RC_ERROR;
+    }
+    const bool chinese = line_is(cmd, "AT+QX_BOOT_SET=1,chinese");
+    if (!chinese && !line_is(cmd, "AT+QX_BOOT_SET=1,english")) return invalid_command(cmd);
+    set_property_file_item_value(kTestInfo, "setupwizard", chinese ? "ZH" : "EN");
+    property_set("persist.sys.lockguide.skip", "yes");
+    if (is_sp) return RC_ATOK;
+    return test_app_ok(chinese ? "setupwizard chinese" : "setupwizard english") ? RC_ATOK : RC_ATNG;
+}
+
 // clang-format off
 int ring_light_test_handler(char *, int, char *) { return RC_NOT_IMPLEMENTED; }
-int haptic_feedback_handler(char *, int, char *) { return RC_NOT_IMPLEMENTED; }
-int set_breath_light_handler(char *, int, char *) { return RC_NOT_IMPLEMENTED; }
 // clang-format on

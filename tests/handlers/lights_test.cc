@@ -16,6 +16,9 @@ namespace {
 constexpr char kPanel0[] = "/sys/class/backlight/panel0-backlight/brightness";  // max 2047
 constexpr char kPanel1[] = "/sys/class/backlight/panel1-backlight/brightness";  // max 1023
 constexpr char kButton[] = "/sys/class/leds/button-backlight/brightness";
+constexpr char kEffect[] = "/sys/class/leds/aw22xxx_led/effect";
+constexpr char kCfg[] = "/sys/class/leds/aw22xxx_led/cfg";
+constexpr char kInfo[] = "/cache/recovery/last_test_info";
 const std::string kLcm = "activity com.pyxa.engineermode/.ATLcmTest android.factorytest.ATLCM ";
 
 std::string nv_record(int32_t assembly_at_mode) {
@@ -153,7 +156,38 @@ INSTANTIATE_TEST_SUITE_P(Lights, LightsLine, ::testing::Values(
          "\r\n+TYPE:\"2\"\r\n", "OK", ""},
     Case{"LedOther", "AT+MMILED=3", 0, false, nullptr, "", "ERROR", ""},
     Case{"BlinkStop", "AT+QXLIGHT=0", 0, false, nullptr, "", "OK", ""},
-    Case{"BlinkOther", "AT+QXLIGHT=2", 0, false, nullptr, "", "ERROR", ""}),
+    Case{"BlinkOther", "AT+QXLIGHT=2", 0, false, nullptr, "", "ERROR", ""},
+    Case{"RingEffectBlue", "AT+QX_BREATH_LGT=1,B", 0, false, nullptr, "", "ATOK", "", {{kEffect, "32"}, {kCfg, "1"}}},
+    Case{"RingEffectGreen", "AT+QX_BREATH_LGT=1,Gx", 0, false, nullptr, "", "ATOK", "", {{kEffect, "31"}, {kCfg, "1"}}},
+    Case{"RingEffectH", "AT+QX_BREATH_LGT=1,H", 0, false, nullptr, "", "ATOK", "", {{kEffect, "2f"}, {kCfg, "1"}}},
+    Case{"RingEffectRed", "AT+QX_BREATH_LGT=1,R", 0, false, nullptr, "", "ATOK", "", {{kEffect, "30"}, {kCfg, "1"}}},
+    Case{"RingEffectOff", "AT+QX_BREATH_LGT=1,0", 0, false, nullptr, "", "ATOK", "", {{kEffect, "0"}, {kCfg, "1"}}},
+    Case{"RingEffectLowerCase", "AT+QX_BREATH_LGT=1,b", 0, false, nullptr, "\r\n\"param 2 error\"\r\n", "ATERROR", "",
+         {{kEffect, "0\n"}}},
+    Case{"RingEffectMissing", "AT+QX_BREATH_LGT=1", 0, false, nullptr, "", "ATERROR", "", {{kEffect, "0\n"}}},
+    Case{"RingEffectEmpty", "AT+QX_BREATH_LGT=1,", 0, false, nullptr, "", "ATERROR", "", {{kEffect, "0\n"}}},
+    Case{"RingEffectOther", "AT+QX_BREATH_LGT=2,B", 0, false, nullptr, "", "ATERROR", ""},
+    Case{"RingEffectNoDriver", "AT+QX_BREATH_LGT=1,B", 0, false,
+         [](const Sandbox &b) { std::filesystem::remove(b.path(kEffect)); }, "", "ATNG", "", {{kCfg, "0\n"}}},
+    Case{"RingEffectNoCfg", "AT+QX_BREATH_LGT=1,R", 0, false,
+         [](const Sandbox &b) { std::filesystem::remove(b.path(kCfg)); }, "", "ATNG", "", {{kEffect, "30"}}},
+    Case{"FeedbackOn", "AT+QXCGFK=1", 0, false, nullptr, "", "OK", "message feedback 1 -> ok\n"},
+    Case{"FeedbackOffRefused", "AT+QXCGFK=0", 0, false, app_refuses, "", "ERROR", "message feedback 0 -> error\n"},
+    Case{"FeedbackStateOn", "AT+QXCGFK=2", 0, false, [](const Sandbox &b) { b.reply("feedback 2", "ok 1"); },
+         "\r\n\"1\"\r\n", "OK", "message feedback 2 -> ok 1\n"},
+    Case{"FeedbackStateOff", "AT+QXCGFK=2", 0, false, [](const Sandbox &b) { b.reply("feedback 2", "ok 0"); },
+         "\r\n\"0\"\r\n", "OK", "message feedback 2 -> ok 0\n"},
+    Case{"FeedbackStateOther", "AT+QXCGFK=2", 0, false, nullptr, "", "ERROR", "message feedback 2 -> ok\n"},
+    Case{"FeedbackStateSilent", "AT+QXCGFK=2", 0, false, [](const Sandbox &b) { b.fault("testapp-silent"); }, "",
+         "ERROR", "message feedback 2 -> (silent)\n"},
+    Case{"FeedbackOther", "AT+QXCGFK=3", 0, false, nullptr, "", "ERROR", ""},
+    Case{"BootChinese", "AT+QX_BOOT_SET=1,chinese", 0, false, nullptr, "", "ATOK",
+         "setprop persist.sys.lockguide.skip=yes\nmessage setupwizard chinese -> ok\n", {{kInfo, "setupwizard=ZH\n"}}},
+    Case{"BootEnglishRefused", "AT+QX_BOOT_SET=1,english", 0, false, app_refuses, "", "ATNG",
+         "setprop persist.sys.lockguide.skip=yes\nmessage setupwizard english -> error\n", {{kInfo, "setupwizard=EN\n"}}},
+    Case{"BootEnglishAtMode", "AT+QX_BOOT_SET=1,english", 1, false, nullptr, "", "ATOK",
+         "setprop persist.sys.lockguide.skip=yes\n", {{kInfo, "setupwizard=EN\n"}}},
+    Case{"BootOther", "AT+QX_BOOT_SET=1,french", 0, false, nullptr, "", "ERROR", ""}),
     [](const ::testing::TestParamInfo<Case> &info) { return info.param.name; });
 
 // One pulse of 10 s, then the worker sleeps; a second start while it runs does nothing.
