@@ -26,6 +26,7 @@
 int g_vibrator_run = 0;
 int g_lights_run = 0;
 int g_panel_test = 0;
+int g_ring_mode = 0;
 
 namespace {
 
@@ -345,6 +346,60 @@ int haptic_feedback_handler(char *cmd, int, char *resp) {
     return test_app_ok(chinese ? "setupwizard chinese" : "setupwizard english") ? RC_ATOK : RC_ATNG;
 }
 
-// clang-format off
-int ring_light_test_handler(char *, int, char *) { return RC_NOT_IMPLEMENTED; }
-// clang-format on
+// The app-driven ring forms answer ATNG even when the test app took the request; only the
+// body "ring_light failed" tells a refusal apart (the station has always read them so).
+int ring_light_by_app(const char *message, char *resp) {
+    if (!test_app_ok(message)) body_printf(resp, "\r\nring_light failed\r\n");
+    return RC_ATNG;
+}
+
+int ring_light_test_handler(char *cmd, int, char *resp) {
+    if (line_is(cmd, "AT+QX_RING_IC=0")) {
+        if (dev::exists(kRingEffect)) return quote_body(resp, "a:OK"), RC_ATOK;
+        const bool a = dev::exists("/sys/class/leds/aw22xxx_led_a/effect");
+        const bool b = dev::exists("/sys/class/leds/aw22xxx_led_b/effect");
+        if (!a && !b) return RC_ATNG;
+        body_printf(resp, "\r\n\"%s,%s\"\r\n", a ? "a:OK" : "a:NG", b ? "b:OK" : "b:NG");
+        return RC_ATOK;
+    }
+    if (line_is(cmd, "AT+QX_RING_LGT=0,0")) return RC_ATOK;
+    if (line_is(cmd, "AT+QX_RING_LGT=0,1")) {
+        g_ring_mode = -1;
+        if (is_sp) return RC_ATOK;
+        if (!test_app_ok("battery_mode set 0,display_id:4096")) {
+            body_printf(resp, "\r\nexit low bat mode failed\r\n");
+        } else if (call_handler(battery_mode_handler, "AT+QX_BAT_MODE=2,0") != RC_ATOK) {
+            body_printf(resp, "\r\nexit super power save mode failed\r\n");
+        }
+        return RC_ATNG;
+    }
+    for (char form : {'1', '2'}) {
+        const std::string head = std::string("AT+QX_RING_LGT=") + form + ",";
+        if (!line_starts(cmd, head.c_str(), 16)) continue;
+        const char *comma = strchr(cmd, ',');
+        if (comma == nullptr || strlen(comma + 1) != 1) return RC_ATERROR;
+        char message[64];
+        snprintf(message, sizeof message, "ring_light %c %s,display_id:4096", form, comma + 1);
+        return ring_light_by_app(message, resp);
+    }
+    if (line_is(cmd, "AT+QX_RING_LGT=3")) {
+        const char *reply = ask_test_app("ring_light 0,display_id:4096");
+        const bool ok = reply != nullptr && strcmp(reply, "ok") == 0;
+        if (ok) property_set("sys.ring_light.cali.para", "0");
+        else body_printf(resp, "\r\nring_light failed\r\n");
+        return RC_ATNG;
+    }
+    if (line_is(cmd, "AT+QX_RING_LGT=6")) {
+        g_ring_mode = 7;
+        return ring_light_by_app("ring_light 3,display_id:4096", resp);
+    }
+    if (line_is(cmd, "AT+QX_RING_LGT=7")) {
+        g_ring_mode = 3;
+        return ring_light_by_app("ring_light 4,display_id:4096", resp);
+    }
+    // The trim-table forms (default restore, white-balance and colour steps) are not built.
+    if (line_is(cmd, "AT+QX_RING_LGT=5") || line_starts(cmd, "AT+QX_RING_LGT=4,", 16) ||
+        line_starts(cmd, "AT+QX_RING_LGT=8,", 16))
+        return RC_NOT_IMPLEMENTED;
+    return RC_ATERROR;
+}

@@ -5,6 +5,9 @@
 extern int g_vibrator_run;   // set while a vibration worker runs (AT+EDFT=6,x, AT+QX_VBR_STH_TS)
 extern int g_lights_run;     // set while the indicator blink runs (AT+QXLIGHT)
 extern int g_panel_test;     // set by AT+EDFT=0,5 in AT mode, cleared by AT+EDFT=0,0
+// The LED ring's calibration mode: -1 calibration not set, -2 brightness not set, 7 or 3
+// after AT+QX_RING_LGT=6 or =7; 0 until one of those forms has run.
+extern int g_ring_mode;
 
 // A 10-second vibration pulse, then a sleep of 10100000 seconds: in effect one pulse
 // and a thread that waits for ever (the long sleep is how the worker has always behaved).

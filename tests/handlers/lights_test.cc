@@ -98,6 +98,11 @@ void engineering(const Sandbox &b) {
     sim::write_kv(b.path("/.sim/config"), "project", &project);
     b.write("/sys/class/leds/green/engineering", "0\n");
 }
+void ring_drivers(const Sandbox &b, bool a, bool bdrv) {
+    std::filesystem::remove(b.path("/sys/class/leds/aw22xxx_led/effect"));
+    if (a) b.write("/sys/class/leds/aw22xxx_led_a/effect", "0\n");
+    if (bdrv) b.write("/sys/class/leds/aw22xxx_led_b/effect", "0\n");
+}
 void nv_write(const Sandbox &b) { b.fault("nv-write"); }
 void nv_read(const Sandbox &b) { b.fault("nv-read"); }
 void app_refuses(const Sandbox &b) { b.fault("testapp-refuse"); }
@@ -187,7 +192,34 @@ INSTANTIATE_TEST_SUITE_P(Lights, LightsLine, ::testing::Values(
          "setprop persist.sys.lockguide.skip=yes\nmessage setupwizard english -> error\n", {{kInfo, "setupwizard=EN\n"}}},
     Case{"BootEnglishAtMode", "AT+QX_BOOT_SET=1,english", 1, false, nullptr, "", "ATOK",
          "setprop persist.sys.lockguide.skip=yes\n", {{kInfo, "setupwizard=EN\n"}}},
-    Case{"BootOther", "AT+QX_BOOT_SET=1,french", 0, false, nullptr, "", "ERROR", ""}),
+    Case{"BootOther", "AT+QX_BOOT_SET=1,french", 0, false, nullptr, "", "ERROR", ""},
+    Case{"RingIcSingleDriver", "AT+QX_RING_IC=0", 0, false, nullptr, "\r\n\"a:OK\"\r\n", "ATOK", ""},
+    Case{"RingIcOnlyB", "AT+QX_RING_IC=0", 0, false, [](const Sandbox &b) { ring_drivers(b, false, true); },
+         "\r\n\"a:NG,b:OK\"\r\n", "ATOK", ""},
+    Case{"RingIcOnlyA", "AT+QX_RING_IC=0", 0, false, [](const Sandbox &b) { ring_drivers(b, true, false); },
+         "\r\n\"a:OK,b:NG\"\r\n", "ATOK", ""},
+    Case{"RingIcNone", "AT+QX_RING_IC=0", 0, false, [](const Sandbox &b) { ring_drivers(b, false, false); }, "",
+         "ATNG", ""},
+    Case{"RingOff", "AT+QX_RING_LGT=0,0", 0, false, nullptr, "", "ATOK", ""},
+    Case{"RingExitLowBattery", "AT+QX_RING_LGT=0,1", 0, false, nullptr, "", "ATNG",
+         "message battery_mode set 0,display_id:4096 -> ok\nservice-start com.zdr.SuperPowerSave/.SuperPowerSaveService "
+         "intent.action.SUPER_POWER_SAVE_SERVICE --es service_action stop\n"},
+    Case{"RingExitLowBatteryRefused", "AT+QX_RING_LGT=0,1", 0, false, app_refuses,
+         "\r\nexit low bat mode failed\r\n", "ATNG", "message battery_mode set 0,display_id:4096 -> error\n"},
+    Case{"RingExitLowBatteryAtMode", "AT+QX_RING_LGT=0,1", 1, false, nullptr, "", "ATOK", ""},
+    Case{"RingColour", "AT+QX_RING_LGT=1,R", 0, false, nullptr, "", "ATNG",
+         "message ring_light 1 R,display_id:4096 -> ok\n"},
+    Case{"RingColourRefused", "AT+QX_RING_LGT=2,W", 0, false, app_refuses, "\r\nring_light failed\r\n", "ATNG",
+         "message ring_light 2 W,display_id:4096 -> error\n"},
+    Case{"RingColourTwoChars", "AT+QX_RING_LGT=1,RG", 0, false, nullptr, "", "ATERROR", ""},
+    Case{"RingColourMissing", "AT+QX_RING_LGT=2", 0, false, nullptr, "", "ATERROR", ""},
+    Case{"RingStop", "AT+QX_RING_LGT=3", 0, false, nullptr, "", "ATNG",
+         "message ring_light 0,display_id:4096 -> ok\nsetprop sys.ring_light.cali.para=0\n"},
+    Case{"RingStopRefused", "AT+QX_RING_LGT=3", 0, false, app_refuses, "\r\nring_light failed\r\n", "ATNG",
+         "message ring_light 0,display_id:4096 -> error\n"},
+    Case{"RingMode7", "AT+QX_RING_LGT=6", 0, false, nullptr, "", "ATNG", "message ring_light 3,display_id:4096 -> ok\n"},
+    Case{"RingMode3", "AT+QX_RING_LGT=7", 0, false, nullptr, "", "ATNG", "message ring_light 4,display_id:4096 -> ok\n"},
+    Case{"RingOther", "AT+QX_RING_LGT=9", 0, false, nullptr, "", "ATERROR", ""}),
     [](const ::testing::TestParamInfo<Case> &info) { return info.param.name; });
 
 // One pulse of 10 s, then the worker sleeps; a second start while it runs does nothing.
