@@ -16,8 +16,3 @@ void wait_for_current_answer();
 // Restarts the device two seconds after the answer has left; arg is a reason text or null.
 void *reboot_thread(void *reason);
 
-// Long-running workers stop when their handler clears the run flag.
-extern int g_vibrator_run;
-extern int g_lights_run;
-void *update_vibrator_thread(void *);
-void *update_indicate_lights_thread(void *);

@@ -33,6 +33,7 @@ extern const DeviceModel kNfcControllerModel;
 extern const DeviceModel kLcmPanelModel;
 extern const DeviceModel kChargerMcuModel;
 extern const DeviceModel kPmicRegmapModel;
+extern const DeviceModel kIndicatorLedModel;
 
 namespace {
 
@@ -44,6 +45,7 @@ const DeviceModel *const kModels[] = {
     &kLcmPanelModel,
     &kChargerMcuModel,
     &kPmicRegmapModel,
+    &kIndicatorLedModel,
 };
 
 struct Session {
