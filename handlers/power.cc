@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cctype>
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
@@ -325,6 +326,26 @@ void append(char *resp, const char *fmt, const std::string &a, const std::string
 
 }  // namespace
 
+namespace {
+
+// A parameter as atoi reads it ("x" is 0), except that a number beyond the record's signed
+// 32 bits is refused instead of wrapped: atoi's overflow is undefined.
+bool record_value(const char *text, int32_t &out) {
+    const char *p = text;
+    while (isspace(static_cast<unsigned char>(*p))) ++p;
+    const char *digits = (*p == '+' || *p == '-') ? p + 1 : p;
+    if (!isdigit(static_cast<unsigned char>(*digits))) {
+        out = 0;
+        return true;
+    }
+    long long v = 0;
+    if (!leading_number(p, INT32_MIN, INT32_MAX, &v)) return false;
+    out = static_cast<int32_t>(v);
+    return true;
+}
+
+}  // namespace
+
 int check_battery_test_handler(char *cmd, int arg, char *resp) {
     if (line_is(cmd, "AT+QXCHARGE=0")) {
         char status[41] = {0};
@@ -347,7 +368,12 @@ int check_battery_test_handler(char *cmd, int arg, char *resp) {
             EM_LOGE("parameter error:%s", first);
             return RC_ERROR;
         }
-        return send_records({{charger::Op::ParamA, atoi(a)}, {charger::Op::ParamB, atoi(b)}}) ? RC_OK : RC_ERROR;
+        int32_t va = 0, vb = 0;
+        if (!record_value(a, va) || !record_value(b, vb)) {
+            EM_LOGE("parameter error:%s", first);
+            return RC_ERROR;
+        }
+        return send_records({{charger::Op::ParamA, va}, {charger::Op::ParamB, vb}}) ? RC_OK : RC_ERROR;
     }
     if (line_starts(cmd, "AT+QXCHARGE=2", 13)) {
         if (strstr(cmd, "2,1") || strstr(cmd, "2,0"))
@@ -363,7 +389,12 @@ int check_battery_test_handler(char *cmd, int arg, char *resp) {
             EM_LOGE("parameter error");
             return RC_ERROR;
         }
-        return send_records({{charger::Op::ParamC, atoi(c)}}) ? RC_OK : RC_ERROR;
+        int32_t vc = 0;
+        if (!record_value(c, vc)) {
+            EM_LOGE("parameter error");
+            return RC_ERROR;
+        }
+        return send_records({{charger::Op::ParamC, vc}}) ? RC_OK : RC_ERROR;
     }
     return power_invalid(cmd);
 }

@@ -140,6 +140,9 @@ INSTANTIATE_TEST_SUITE_P(ChargerController, PowerFamily, ::testing::Values(
     Case{.line = "AT+QXCHARGE=3,2", .tag = "", .word = "ERROR"},
     Case{.line = "AT+QXCHARGE=4,-1", .tag = "", .word = "OK", .events = "charger param_c -1\n"},
     Case{.line = "AT+QXCHARGE=4", .tag = "NoValue", .word = "ERROR", .after = {{kBurn, ""}}},
+    Case{.line = "AT+QXCHARGE=4,x", .tag = "NotANumberIsZero", .word = "OK", .events = "charger param_c 0\n"},
+    Case{.line = "AT+QXCHARGE=4,2147483648", .tag = "BeyondInt32", .word = "ERROR", .after = {{kBurn, ""}}},
+    Case{.line = "AT+QXCHARGE=1,5,-99999999999", .tag = "BeyondInt32", .word = "ERROR", .after = {{kBurn, ""}}},
     Case{.line = "AT+QXCHARGE=5", .tag = "", .word = "ERROR"}),
     name_of);
 
