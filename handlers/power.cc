@@ -46,7 +46,6 @@ constexpr char kBatteryVolt[] = "/sys/class/power_supply/battery/voltage_now";
 constexpr char kBatteryCapacity[] = "/sys/class/power_supply/battery/capacity";
 constexpr char kVbatDiff[] = "/sys/class/power_supply/battery/chg_est_vbat_diff";
 constexpr char kAcCurrent[] = "/sys/class/power_supply/cms/current_ac_avg_now";
-constexpr char kPullDown[] = "/sys/class/power_supply/usb/usb_con_vbus_pull_down";
 
 constexpr char kTestFinish[] = "persist.sys.fast_charge.test_finish";
 constexpr char kFastParams[] = "persist.sys.fast_charge";
