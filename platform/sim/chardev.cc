@@ -214,7 +214,7 @@ void for_each_open(const DeviceModel &model, const std::function<void(Device &)>
 }
 
 int device_open(const char *device_path, int flags) {
-    std::string path = "/" + normal_path(device_path);
+    std::string path = rooted_path(device_path);
     const DeviceModel *model = serving(path);
     bool node = false;
     if (model == nullptr && (flags & O_ACCMODE) != O_RDONLY) {
@@ -304,7 +304,7 @@ bool device_read(int fd, void *buf, size_t len, ssize_t *result) {
     return true;
 }
 
-bool node_owned(const char *device_path) { return owning("/" + normal_path(device_path)) != nullptr; }
+bool node_owned(const char *device_path) { return owning(rooted_path(device_path)) != nullptr; }
 
 void settle() {
     int saved = errno;

@@ -242,8 +242,13 @@ int get_cpuid(char *buf, int len) {
 }
 
 int is_calibrate_item_support(const char *item) {
-    std::string items = "," + sim::config("calibrate_items") + ",";
-    return items.find("," + opt(item) + ",") != std::string::npos;
+    // Appended piece by piece: GCC 12 warns (falsely) on "," + a temporary string.
+    std::string items(1, ','), wanted(1, ',');
+    items += sim::config("calibrate_items");
+    items += ',';
+    wanted += opt(item);
+    wanted += ',';
+    return items.find(wanted) != std::string::npos;
 }
 
 // The fault "calibrate-item" makes the item store refuse the state (an I/O error).

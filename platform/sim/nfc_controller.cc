@@ -87,7 +87,12 @@ void send(sim::Device &d, const Bytes &frame) {
 }
 
 Bytes message(uint8_t b0, uint8_t b1, Bytes payload) {
-    Bytes m{b0, b1, static_cast<uint8_t>(payload.size())};
+    // Reserved first: GCC 12 warns (falsely, -Warray-bounds) when the header's storage grows.
+    Bytes m;
+    m.reserve(3 + payload.size());
+    m.push_back(b0);
+    m.push_back(b1);
+    m.push_back(static_cast<uint8_t>(payload.size()));
     m.insert(m.end(), payload.begin(), payload.end());
     return m;
 }

@@ -34,7 +34,7 @@ std::string pmic_regmap_data(const std::string &count_text, const std::string &a
     if (count > 256) count = 256;  // a debugfs read is one page at most
     std::string out;
     for (long a = address; a < address + count; ++a) {
-        char key[16];
+        char key[24];
         snprintf(key, sizeof key, "0x%lx", a);
         std::string value = "0";
         read_kv(state("pmic_registers"), key, value);

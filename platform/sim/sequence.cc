@@ -28,7 +28,7 @@ std::string canonical_name(const std::string &name) {
     if (colon != std::string::npos)
         for (const char *kind : kKinds)
             if (name.compare(0, colon, kind) == 0) return name;
-    return "/" + normal_path(name.c_str());
+    return rooted_path(name.c_str());
 }
 
 std::vector<Sequence> parse(const std::string &file) {
@@ -177,7 +177,7 @@ bool sequence_reply(const std::string &kind, const std::string &message, std::st
 
 void sequence_node(const char *device_path) {
     std::string value;
-    if (!sequence_next("/" + normal_path(device_path), value)) return;
+    if (!sequence_next(rooted_path(device_path), value)) return;
     int saved = errno;
     write_file_atomic(map(device_path), value + "\n");
     errno = saved;

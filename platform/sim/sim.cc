@@ -45,6 +45,13 @@ void set_root(const std::string &r) {
     g_root_set = true;
 }
 
+// Built by appending: GCC 12 warns (falsely, -Wrestrict) on "/" + a temporary string.
+std::string rooted_path(const char *device_path) {
+    std::string out(1, '/');
+    out += normal_path(device_path);
+    return out;
+}
+
 std::string normal_path(const char *device_path) {
     std::vector<std::string> parts;
     std::string p = device_path ? device_path : "";

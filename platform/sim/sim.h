@@ -17,6 +17,8 @@ void set_root(const std::string &root);
 std::string map(const char *device_path);
 // The device path in its plain form: no leading "/", no "." or "..", single slashes.
 std::string normal_path(const char *device_path);
+// The same with one leading "/": the key under which models and sequences know a path.
+std::string rooted_path(const char *device_path);
 // Attribute nodes (sysfs, procfs, the regmap and other debugfs nodes: everything under
 // sys/, proc/ and d/) hold one value that every write replaces, whatever the open flags;
 // every other file behaves as a real file.
