@@ -7,9 +7,15 @@
 #include <pthread.h>
 #include <unistd.h>
 
+#include <strings.h>
+
+#include <array>
 #include <climits>
+#include <cmath>
+#include <cstdlib>
 #include <cstring>
 #include <string>
+#include <vector>
 
 #include "core/command_tables/handlers.h"
 #include "core/nv.h"
@@ -346,12 +352,200 @@ int haptic_feedback_handler(char *cmd, int, char *resp) {
     return test_app_ok(chinese ? "setupwizard chinese" : "setupwizard english") ? RC_ATOK : RC_ATNG;
 }
 
+namespace {
+
+// ---- The LED ring's trim table
+
+constexpr int kTrimEntries = 50;
+// One entry as the driver takes it, "0x%02x", and the table of both drivers.
+using TrimEntry = std::array<char, sizeof "0xff">;
+using TrimTable = std::array<TrimEntry, kTrimEntries>;
+constexpr unsigned char kDefaultTrim[kTrimEntries] = {
+    0xff, 0xff, 0xff, 0xff, 0xff, 0xff, 0x0f, 0x00, 0x00, 0xf3, 0x3e, 0x00, 0x49, 0xff, 0x39, 0xe3, 0x36,
+    0x26, 0x05, 0x00, 0x0a, 0x88, 0x00, 0x02, 0x05, 0x40, 0xff, 0xff, 0xff, 0xff, 0x0f, 0x00, 0x00, 0xf3,
+    0x3e, 0x00, 0x49, 0xff, 0x36, 0x7b, 0x32, 0x3a, 0x08, 0x00, 0x07, 0x49, 0x02, 0x01, 0x04, 0x2d};
+constexpr const char *kTrimData[2] = {"/sys/class/leds/aw22xxx_led_a/trim_data",
+                                      "/sys/class/leds/aw22xxx_led_b/trim_data"};
+constexpr const char *kTrim[2] = {"/sys/class/leds/aw22xxx_led_a/trim", "/sys/class/leds/aw22xxx_led_b/trim"};
+// The trim node reads back a 27-character title, then the registers: 0 and 1 at 27,
+// 2 to 25 at 37, 26 to 49 at 157.
+constexpr size_t kTrimFirst = 27, kTrimSecond = 37, kTrimUpper = 157;
+
+// The default table, or the calibration base: the default with entries 0 and 1 at 0x18, 0x06.
+TrimTable trim_table(bool calibration_base) {
+    TrimTable t;
+    for (int i = 0; i < kTrimEntries; ++i) {
+        unsigned value = kDefaultTrim[i];
+        if (calibration_base && i < 2) value = i == 0 ? 0x18 : 0x06;
+        snprintf(t[i].data(), t[i].size(), "0x%02x", value);
+    }
+    return t;
+}
+
+// Moves one entry by delta, kept within a byte.
+void change_color_hex(TrimEntry &text, int delta) {
+    long value = strtol(text.data(), nullptr, 16) + delta;
+    value = value < 0 ? 0 : value > 255 ? 255 : value;
+    snprintf(text.data(), text.size(), "0x%02lx", value);
+}
+
+// The given entries, each followed by a comma: what the drivers must read back.
+std::string trim_text(const TrimTable &t, const std::vector<int> &indexes) {
+    std::string out;
+    for (int i : indexes) out.append(t[i].data()).push_back(',');
+    return out;
+}
+
+std::vector<int> trim_range(int first, int last, std::vector<int> out = {}) {
+    for (int i = first; i <= last; ++i) out.push_back(i);
+    return out;
+}
+
+// Loads the given entries into driver a and then b, index by index, and starts both
+// trims. 0 when every write was taken, else the answer with its body written.
+int load_trim(const TrimTable &t, const std::vector<int> &indexes, char *resp) {
+    for (int i : indexes) {
+        for (int d = 0; d < 2; ++d) {
+            char line[16];
+            snprintf(line, sizeof line, "%x %s\n", i, t[i].data());
+            if (dev::write_node(kTrimData[d], line) < 0) {
+                body_printf(resp, "\r\n\"write the trim_data %c fail\"\r\n", 'a' + d);
+                return RC_ATERROR;
+            }
+        }
+    }
+    for (int d = 0; d < 2; ++d) {
+        if (dev::write_node(kTrim[d], "1") < 0) {
+            body_printf(resp, "\r\n\"write the trim %c fail\"\r\n", 'a' + d);
+            return RC_ATERROR;
+        }
+    }
+    return 0;
+}
+
+// Both drivers read back: from trim_data (at most 253 bytes, the first 249 characters)
+// or, with upper set, from the trim registers (at most 400 bytes, the entries 0 and 1
+// and the 24 entries at upper, 130 characters). Line feeds are removed first; the
+// comparison ignores case.
+int verify_trim(const std::string &want, bool registers, size_t upper, char *resp) {
+    const size_t compared = registers ? 130 : 249;
+    for (int d = 0; d < 2; ++d) {
+        std::string got;
+        if (!dev::read_node(registers ? kTrim[d] : kTrimData[d], got, registers ? 400 : 253)) return RC_ATNG;
+        std::erase(got, '\n');
+        if (registers) {
+            auto slice = [&got](size_t at, size_t n) { return at < got.size() ? got.substr(at, n) : std::string(); };
+            got = slice(kTrimFirst, 10) + slice(upper, 120);
+        }
+        if (got.size() < compared || strncasecmp(got.c_str(), want.c_str(), compared) != 0) {
+            body_printf(resp, "\r\n\"cali trim_data %c mismatch\"\r\n", 'a' + d);
+            return RC_ATNG;
+        }
+    }
+    return RC_ATOK;
+}
+
+int load_and_verify(const TrimTable &t, const std::vector<int> &indexes, size_t upper, char *resp) {
+    if (int rc = load_trim(t, indexes, resp)) return rc;
+    return verify_trim(trim_text(t, indexes), true, upper, resp);
+}
+
+// The colour-meter readings after the command: exactly count of them, none zero. A
+// reading that is not a number reads as 0, as atof reads it. NaN and infinities are
+// refused too: a NaN would reach the integer conversion of a step, which is undefined.
+bool ring_readings(const char *cmd, size_t count, std::vector<double> &out) {
+    std::vector<std::string_view> fields = comma_fields(cmd);
+    if (fields.size() != count + 1) return false;
+    out.clear();
+    for (size_t i = 1; i < fields.size(); ++i) {
+        const double v = atof(std::string(fields[i]).c_str());
+        if (v == 0 || !std::isfinite(v)) return false;
+        out.push_back(v);
+    }
+    return true;
+}
+
+int invalid_parameter(char *resp) {
+    quote_reason(resp, "invalid parameter");
+    return RC_ATERROR;
+}
+
+int restore_default_trim(char *resp) {
+    property_set("sys.ring_light.cali.para", "1");
+    g_ring_mode = -2;
+    const TrimTable t = trim_table(false);
+    const std::vector<int> all = trim_range(0, kTrimEntries - 1);
+    if (int rc = load_trim(t, all, resp)) return rc;
+    return verify_trim(trim_text(t, all), false, 0, resp);
+}
+
+// White balance from six readings: entry 14 follows the difference of readings 4 and 1,
+// entry 15 that of readings 2 and 5. The divisors are single-precision constants, so the
+// steps are truncated exactly as the station's calibration tables expect.
+int white_balance_step(const char *cmd, char *resp) {
+    std::vector<double> m;
+    if (!ring_readings(cmd, 6, m)) return invalid_parameter(resp);
+    TrimTable t = trim_table(true);
+    const double d1 = std::fabs(m[3] - m[0]);
+    const int step = d1 >= 0.03 ? 15 : static_cast<int>(d1 / 0.002f);
+    change_color_hex(t[14], m[0] < m[3] ? step : -step);
+    const double d2 = std::fabs(m[1] - m[4]);
+    if (m[1] > m[4]) {
+        // A large difference raises the entry although a small one lowers it: the
+        // calibration line depends on this asymmetry.
+        if (d2 > 0.006 && d2 < 0.024) change_color_hex(t[15], -static_cast<int>(d2 / 0.0003f));
+        else if (d2 >= 0.024) change_color_hex(t[15], 80);
+    } else if (d2 < 0.024) {
+        change_color_hex(t[15], static_cast<int>(d2 / 0.0003f));
+    }
+    return load_and_verify(t, trim_range(0, 25), kTrimSecond, resp);
+}
+
+// One colour adjustment of AT+QX_RING_LGT=8: two readings, and the entry and threshold in
+// ring mode 3 and in ring mode 7.
+struct ColourAdjust {
+    int first, second;
+    int entry3;
+    double limit3;
+    int entry7;
+    double limit7;
+};
+constexpr ColourAdjust kColourAdjust[] = {
+    {18, 21, 39, 0.5984, 15, 0.6},    {19, 22, 40, 0.7404, 16, 0.6146}, {0, 3, 42, 1.2964, 18, 1.3202},
+    {1, 4, 43, 0.6538, 19, 0.6528},   {6, 9, 45, 0.5038, 21, 0.5052},   {7, 10, 46, 1.2496, 22, 1.2936},
+    {12, 15, 48, 0.3046, 24, 0.3022}, {13, 16, 49, 0.1554, 25, 0.1518},
+};
+
+// Colour from 36 readings, for the half of the ring that mode 3 or 7 lit: one step up or
+// down per reading pair; only that half's entries (and entries 0 and 1) are written.
+int colour_step(const char *cmd, char *resp) {
+    const int mode = g_ring_mode;  // read once: the table, the writes and the read-back agree
+    if (mode == -2) return quote_reason(resp, "brightness not set"), RC_ATERROR;
+    if (mode == -1) return quote_reason(resp, "calibration not set"), RC_ATERROR;
+    std::vector<double> r;
+    if (!ring_readings(cmd, 36, r)) return invalid_parameter(resp);
+    TrimTable t = trim_table(true);
+    if (mode == 3 || mode == 7) {
+        for (const ColourAdjust &a : kColourAdjust) {
+            const double sum = r[a.first] + r[a.second];
+            const int entry = mode == 3 ? a.entry3 : a.entry7;
+            change_color_hex(t[entry], sum > (mode == 3 ? a.limit3 : a.limit7) ? -1 : 1);
+        }
+    }
+    std::vector<int> indexes = trim_range(0, kTrimEntries - 1);
+    if (mode == 3) indexes = trim_range(26, kTrimEntries - 1, {0, 1});
+    if (mode == 7) indexes = trim_range(0, 25);
+    return load_and_verify(t, indexes, mode == 3 ? kTrimUpper : kTrimSecond, resp);
+}
+
 // The app-driven ring forms answer ATNG even when the test app took the request; only the
 // body "ring_light failed" tells a refusal apart (the station has always read them so).
 int ring_light_by_app(const char *message, char *resp) {
     if (!test_app_ok(message)) body_printf(resp, "\r\nring_light failed\r\n");
     return RC_ATNG;
 }
+
+}  // namespace
 
 int ring_light_test_handler(char *cmd, int, char *resp) {
     if (line_is(cmd, "AT+QX_RING_IC=0")) {
@@ -397,9 +591,8 @@ int ring_light_test_handler(char *cmd, int, char *resp) {
         g_ring_mode = 3;
         return ring_light_by_app("ring_light 4,display_id:4096", resp);
     }
-    // The trim-table forms (default restore, white-balance and colour steps) are not built.
-    if (line_is(cmd, "AT+QX_RING_LGT=5") || line_starts(cmd, "AT+QX_RING_LGT=4,", 16) ||
-        line_starts(cmd, "AT+QX_RING_LGT=8,", 16))
-        return RC_NOT_IMPLEMENTED;
+    if (line_is(cmd, "AT+QX_RING_LGT=5")) return restore_default_trim(resp);
+    if (line_starts(cmd, "AT+QX_RING_LGT=4", 16)) return white_balance_step(cmd, resp);
+    if (line_starts(cmd, "AT+QX_RING_LGT=8", 16)) return colour_step(cmd, resp);
     return RC_ATERROR;
 }

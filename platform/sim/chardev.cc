@@ -34,6 +34,7 @@ extern const DeviceModel kLcmPanelModel;
 extern const DeviceModel kChargerMcuModel;
 extern const DeviceModel kPmicRegmapModel;
 extern const DeviceModel kIndicatorLedModel;
+extern const DeviceModel kLedRingModel;
 
 namespace {
 
@@ -46,6 +47,7 @@ const DeviceModel *const kModels[] = {
     &kChargerMcuModel,
     &kPmicRegmapModel,
     &kIndicatorLedModel,
+    &kLedRingModel,
 };
 
 struct Session {

@@ -1,6 +1,7 @@
 #include "platform/sim/sequence.h"
 
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <cstdio>
@@ -179,7 +180,9 @@ void sequence_node(const char *device_path) {
     std::string value;
     if (!sequence_next(rooted_path(device_path), value)) return;
     int saved = errno;
-    write_file_atomic(map(device_path), value + "\n");
+    // "(missing)": the part drops off, so this read (and every later open) fails.
+    if (value == "(missing)") ::unlink(map(device_path).c_str());
+    else write_file_atomic(map(device_path), value + "\n");
     errno = saved;
 }
 

@@ -16,7 +16,8 @@
 // camera or shell (a message or command; "*" may stand for any text, an exact name wins
 // over patterns, and a sequence wins over the reply script), or sensor, audio, modem or
 // config (a key of that key=value script). In a value "\n" is a line break, "\t" a tab,
-// "\\" a backslash, a leading "\#" or "\[" a "#" or "["; "(empty)" is the empty value; lines
+// "\\" a backslash, a leading "\#" or "\[" a "#" or "["; "(empty)" is the empty value, and
+// for a node "(missing)" removes the node before the read (a part that drops off); lines
 // starting with "#" are comments. How far each sequence has got is kept in
 // <root>/.sim/sequences.pos, so it survives a daemon restart; a sequence whose values
 // change, or whose position line is deleted, starts again from its first value.
