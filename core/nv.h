@@ -4,6 +4,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <mutex>
 
 #include "platform/factory.h"
 
@@ -52,9 +53,20 @@ inline bool write(const Record &rec) { return put_PYXA_NV_item(rec.bytes) == 0; 
 
 enum class Update { Ok, ReadFailed, WriteFailed };
 
+// Handlers change the record under the dispatch mutex, but the sensor calibration workers
+// write their offsets from their own threads: every read-change-write holds this lock, so
+// neither overwrites the other's field with a stale copy of the record.
+inline std::mutex &record_mutex() {
+    static std::mutex m;
+    return m;
+}
+// Held by a handler that reads, changes and writes the record by hand (update() holds it itself).
+[[nodiscard]] inline std::unique_lock<std::mutex> hold() { return std::unique_lock<std::mutex>(record_mutex()); }
+
 // Read, change one field, write back: the only way the record is ever changed.
 template <typename Fn>
 Update update(Fn &&change) {
+    const std::lock_guard<std::mutex> held(record_mutex());
     Record rec;
     if (!read(rec)) return Update::ReadFailed;
     change(rec);

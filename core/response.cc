@@ -64,8 +64,9 @@ void wait_writable(int fd, int timeout_ms) {
 // Writes all of data within the limit: the count written, or -1 when nothing was. A port
 // whose last write timed out gets no fresh wait until it takes output again, so a stopped
 // station costs the others one wait, not one per line.
-ssize_t write_serial_bounded(int fd, const char *data, size_t len, SerialOut &out) {
+ssize_t write_serial_bounded(const int *slot, const char *data, size_t len, SerialOut &out) {
     std::lock_guard<std::mutex> hold(out.lock);
+    const int fd = *slot;  // read under the lock: a reopen replaces it only under the lock
     bool *stalled = &out.stalled;
     int flags = fcntl(fd, F_GETFL);
     if (flags < 0) return -1;
@@ -161,8 +162,10 @@ void save_command(const char *data, size_t len) {
     }
 }
 
-void write_serial(int fd, const char *data, int len, const char *what, SerialOut &out) {
-    ssize_t n = write_serial_bounded(fd, data, static_cast<size_t>(len), out);
+SerialOut &serial_out(const int *slot) { return g_serial_out[slot == &g_port.uart_fd ? 0 : 1]; }
+
+void write_serial(const int *slot, const char *data, int len, const char *what) {
+    ssize_t n = write_serial_bounded(slot, data, static_cast<size_t>(len), serial_out(slot));
     if (n < len) LOGW("Couldn't write all data to %s. Wrote only %d error: %d", what, static_cast<int>(n), errno);
 }
 
@@ -201,10 +204,10 @@ void writeDataToSerial(const char *data, int len) {
     int src = current_source();
     switch (src) {
         case SRC_UART:
-            write_serial(g_port.uart_fd, data, len, "UART", g_serial_out[0]);
+            write_serial(&g_port.uart_fd, data, len, "UART");
             break;
         case SRC_USB:
-            write_serial(g_port.usb_fd, data, len, "USB", g_serial_out[1]);
+            write_serial(&g_port.usb_fd, data, len, "USB");
             break;
         case SRC_TCP:
             writeDataToSocket(data, len);
@@ -227,6 +230,12 @@ void writeDataToSerial(const char *data, int len) {
             break;
     }
     save_command(data, text_len);
+}
+
+void replace_serial_fd(int *slot, int fd) {
+    std::lock_guard<std::mutex> hold(serial_out(slot).lock);
+    if (*slot >= 0) close(*slot);
+    *slot = fd;
 }
 
 void writeDataToSocket(const char *data, int len) {

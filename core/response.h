@@ -5,6 +5,11 @@ void writeDataToserialByResponseType(const char *echo, const char *body, int res
 // Raw bytes to the current source; logged to the command log except for the local socket.
 void writeDataToSerial(const char *data, int len);
 void writeDataToSocket(const char *data, int len);
+// Closes a serial port's descriptor (if open) and stores fd in its slot (&g_port.uart_fd or
+// &g_port.usb_fd), under the lock of that port's writers: a worker streaming frames to the
+// port never writes to a descriptor that its reader closed, and perhaps opened again as
+// another file, under it.
+void replace_serial_fd(int *slot, int fd);
 // True once for a TCP station that took no answers and was disconnected: its reader
 // then serves nothing more of what the station had already sent.
 bool tcp_station_dropped(int fd);

@@ -13,6 +13,7 @@
 #include "core/dispatch.h"
 #include "core/line_gather.h"
 #include "core/port_state.h"
+#include "core/response.h"
 #include "core/transports.h"
 #include "platform/device.h"
 #include "platform/log.h"
@@ -52,11 +53,11 @@ bool nothing_to_read(ssize_t n) { return n < 0 && (errno == EAGAIN || errno == E
 // False when the port cannot be reopened: the transport's thread then ends.
 bool reopen(int *slot, const char *path, Clock::time_point *last) {
     LOGE("Error in serail read:%d", errno);
-    close(*slot);
+    replace_serial_fd(slot, -1);
     auto now = Clock::now();
     if (now - *last < kReopenGap) std::this_thread::sleep_for(kReopenGap - (now - *last));
     *last = Clock::now();
-    *slot = open_serial_device(path);
+    replace_serial_fd(slot, open_serial_device(path));
     if (*slot < 0) {
         LOGE("The process is terminated due to fatal error");
         return false;
@@ -68,7 +69,7 @@ bool reopen(int *slot, const char *path, Clock::time_point *last) {
 
 void *serial_thread(int *slot, const char *path, void (*monitor)()) {
     for (int attempt = 0; attempt < 5; ++attempt) {
-        *slot = open_serial_device(path);
+        replace_serial_fd(slot, open_serial_device(path));
         if (*slot >= 0) {
             monitor();
             break;

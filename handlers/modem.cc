@@ -83,6 +83,7 @@ int dpdt_state(char *resp) {
 }
 
 int dpdt_service_start() {
+    const auto held = nv::hold();
     nv::Record rec;
     if (!nv::read(rec)) return RC_ERROR;
     int32_t adb = rec.i32(nv::kAdbFlag);

@@ -318,6 +318,7 @@ int first_boot_handler(char *cmd, int arg, char *resp) {
         LOGE("unknow cmdline %s", cmd);
         return RC_ERROR;
     }
+    const auto held = nv::hold();
     nv::Record rec;
     if (!nv::read(rec)) {
         // An unreadable record must not stop the line here: the station moves on.

@@ -107,6 +107,7 @@ bool close_flags_read_back() {
 
 // Closes the debug port for shipping and restores the user settings: 0, or -1 on any failure.
 int close_adb() {
+    const auto held = nv::hold();
     nv::Record rec;
     if (!nv::read(rec)) {
         LOGE("get_PYXA_NV_item failed");

@@ -97,6 +97,7 @@ int restore_delayed(char *cmd, char *resp) {
         return RC_ERROR;
     }
 
+    const auto held = nv::hold();  // the buffer is written back again below
     nv::Record rec;
     if (nv::read(rec)) {
         rec.set_i32(nv::kResetDelay, seconds);
