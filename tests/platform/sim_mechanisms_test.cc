@@ -66,7 +66,7 @@ struct Node {
 
 const Node kNodes[] = {
     {"Sysfs", "/sys/class/power_supply/battery/keep_chg_soc", true}, {"SysfsRelative", "sys/lcm/oled_acl", true},
-    {"Procfs", "/proc/sysrq-trigger", true},          {"Regmap", "/d/regmap/spmi0-00/address", true},
+    {"Procfs", "/proc/sysrq-trigger", true},          {"Regmap", "/d/regmap/spmi0-00/data", true},
     {"Debugfs", "/sys/kernel/debug/cms/debug", true}, {"DataFile", "/data/vendor/engineermode/bt_device", false},
     {"PersistFile", "/persist/wlan_mac.bin", false},  {"CacheFile", "cache/recovery/last_atcmd0", false},
 };
