@@ -184,68 +184,53 @@ TEST_F(SimTest, BluetoothToolsActOnTheSandbox) {
     EXPECT_EQ(box.prop("bluetooth.bdt.kaeldut"), "false");
 }
 
-TEST_F(SimTest, CameraRepliesFollowTheScript) {
+std::string camera(const char *message) { return sendMessageToCamera(message); }
+// "verdict,v0,v1,v2,v3" of a sensor test whose record was preset with a stray value.
+std::string sensor(int id) {
+    SensorTestResult r{};
+    r.value[1] = 99;
+    if (kael_sensor_factory_test(id, &r, 0, 0) != 0) return "failed";
+    std::string s = std::to_string(r.success);
+    for (int i = 0; i < 4; ++i) s += "," + std::to_string(static_cast<int>(r.value[i] * 10));
+    return s;
+}
+std::string em(int id) {
+    char reply[ZDR_EM_REPLY_SIZE] = {0};
+    return qmi_zdr_set_em_status(id, reply) != 0 ? "failed" : reply;
+}
+std::string modem_nv(uint32_t id) {
+    uint32_t req[8] = {id};
+    int32_t value[6] = {0};
+    return qmi_zdr_read_nv_msg(req, value, 23) != 0 ? "failed" : std::to_string(value[0]);
+}
+std::string gps(int option) {
+    char reply[ZDR_GPS_REPLY_SIZE] = {0};
+    zdr_gps_option_req g{option};
+    return qmi_zdr_gps_option_msg(&g, reply) != 0 ? "failed" : reply;
+}
+
+// Camera, sensor, modem and audio libraries answer from their scripts (the longest
+// pattern first, defaults for what is not listed) and fail with their fault set.
+TEST_F(SimTest, LibrariesAnswerFromTheirScriptsAndFailOnFaults) {
     box.write("/.sim/camera.replies",
               "eng_AT_camera#*#auto_test_get_result#* => success#r#af 1\neng_AT_camera#* => fail#generic\ncapture => success\n");
-    EXPECT_STREQ(sendMessageToCamera("capture"), "success");
-    EXPECT_STREQ(sendMessageToCamera("eng_AT_camera#rear#main#auto_test_get_result#params 0"), "success#r#af 1");
-    EXPECT_STREQ(sendMessageToCamera("eng_AT_camera#rear#tele#open#NULL#NULL"), "fail#generic");
-    EXPECT_STREQ(sendMessageToCamera("stop"), "fail#no reply scripted");
-    box.fault("camera");
-    EXPECT_EQ(std::string(sendMessageToCamera("capture")).find("success"), std::string::npos);
-    EXPECT_TRUE(recorded("camera capture -> success"));
-}
-
-// Scripted verdict and values, "absent" fails, an unlisted sensor passes with zeros.
-TEST_F(SimTest, SensorTestsFillTheRecordFromTheScript) {
     box.write("/.sim/sensor", "48=1,12.5,-7,25\n49=0,1,2,3\n51=absent\n");
-    SensorTestResult r;
-    auto run = [&r](int id) {
-        r = SensorTestResult{};
-        r.value[1] = 99;
-        return kael_sensor_factory_test(id, &r, 0, 0);
-    };
-    ASSERT_EQ(run(48), 0);
-    EXPECT_EQ(r.success, 1u);
-    EXPECT_EQ(std::vector<float>(r.value, r.value + 4), (std::vector<float>{12.5f, -7, 25, 0}));
-    ASSERT_EQ(run(49), 0);
-    EXPECT_EQ(r.success, 0u);
-    EXPECT_NE(run(51), 0);
-    ASSERT_EQ(run(519), 0);
-    EXPECT_EQ(r.success, 1u);
-    EXPECT_EQ(r.value[1], 0.0f);
-    box.fault("sensor");
-    EXPECT_NE(run(48), 0);
-}
-
-TEST_F(SimTest, ModemAnswersFromTheScriptAndKeepsNvWrites) {
     box.write("/.sim/modem", "em.118=6\nnv.26693=3\ngps.2=+QXGPS: 12\n");
-    char reply[ZDR_EM_REPLY_SIZE] = {0};
-    ASSERT_EQ(qmi_zdr_set_em_status(118, reply), 0);
-    EXPECT_STREQ(reply, "6");
-    ASSERT_EQ(qmi_zdr_set_em_status(110, reply), 0);
-    EXPECT_STREQ(reply, "0");
-    uint32_t req[8] = {26693};
-    int32_t value[6] = {0};
-    ASSERT_EQ(qmi_zdr_read_nv_msg(req, value, 23), 0);
-    EXPECT_EQ(value[0], 3);
-    req[0] = 30001;
-    EXPECT_NE(qmi_zdr_read_nv_msg(req, value, 23), 0);  // never written
-    req[1] = 2;
-    ASSERT_EQ(qmi_zdr_write_nv_msg(req, 4), 0);
-    ASSERT_EQ(qmi_zdr_read_nv_msg(req, value, 23), 0);
-    EXPECT_EQ(value[0], 2);
-    char gps[ZDR_GPS_REPLY_SIZE] = {0};
-    zdr_gps_option_req g{2};
-    ASSERT_EQ(qmi_zdr_gps_option_msg(&g, gps), 0);
-    EXPECT_STREQ(gps, "+QXGPS: 12");
-    box.fault("modem");
-    EXPECT_NE(qmi_zdr_set_em_status(118, reply), 0);
-    EXPECT_NE(qmi_zdr_gps_option_msg(&g, gps), 0);
-}
-
-TEST_F(SimTest, AudioResultsRecordingsAndPlaybackFiles) {
     box.write("/.sim/audio", "exitSendTest=5\nftm.22=7\n");
+    EXPECT_EQ(camera("capture"), "success");
+    EXPECT_EQ(camera("eng_AT_camera#rear#main#auto_test_get_result#params 0"), "success#r#af 1");
+    EXPECT_EQ(camera("eng_AT_camera#rear#tele#open#NULL#NULL"), "fail#generic");
+    EXPECT_EQ(camera("stop"), "fail#no reply scripted");
+    EXPECT_EQ(sensor(48), "1,125,-70,250,0");
+    EXPECT_EQ(sensor(49), "0,10,20,30,0");
+    EXPECT_EQ(sensor(51), "failed");
+    EXPECT_EQ(sensor(519), "1,0,0,0,0");  // unlisted: passes with zeros
+    EXPECT_EQ(em(118) + em(110), "60");
+    EXPECT_EQ(modem_nv(26693) + modem_nv(30001), "3failed");  // 30001 never written
+    uint32_t req[8] = {30001, 2};
+    ASSERT_EQ(qmi_zdr_write_nv_msg(req, 4), 0);
+    EXPECT_EQ(modem_nv(30001), "2");
+    EXPECT_EQ(gps(2), "+QXGPS: 12");
     EXPECT_EQ(startSendTest(80), 0);
     EXPECT_EQ(exitSendTest(), 5);
     EXPECT_EQ(audio_ftm_process(22, 1, 1), 7);
@@ -256,7 +241,11 @@ TEST_F(SimTest, AudioResultsRecordingsAndPlaybackFiles) {
     EXPECT_FALSE(box.exists("/data/media/0/engineermode/main-record.wav"));
     EXPECT_EQ(audio_ftm_process(51, 1, 100), 0);  // /sdcard is the emulated storage
     EXPECT_EQ(box.read("/data/media/0/engineermode/main-record.wav").substr(0, 4), "RIFF");
-    box.fault("audio");
+
+    for (const char *f : {"camera", "sensor", "modem", "audio"}) box.fault(f);
+    EXPECT_EQ(camera("capture").find("success"), std::string::npos);
+    EXPECT_TRUE(recorded("camera capture -> success"));
+    EXPECT_EQ(sensor(48) + em(118) + gps(2), "failedfailedfailed");
     EXPECT_NE(startMainEchoTest(), 0);
 }
 
