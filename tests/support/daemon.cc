@@ -113,6 +113,15 @@ int Daemon::connect_local() const {
     return socket_local_client(local_name.c_str(), ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM);
 }
 
+std::string Daemon::ask_local(const std::string &line) const {
+    int s = connect_local();
+    if (s < 0) return "(no connection)";
+    send(s, line.data(), line.size(), MSG_NOSIGNAL);
+    std::string got = read_some(s, 1 << 16, 5000);
+    close(s);
+    return got;
+}
+
 int Daemon::stop(int sig) {
     kill(pid, sig);
     int status = 0;
@@ -136,6 +145,17 @@ Pty::~Pty() {
 }
 
 bool Pty::send(const std::string &s) const { return write(master, s.data(), s.size()) == static_cast<ssize_t>(s.size()); }
+
+bool Pty::ready() const {
+    for (int i = 0; i < 50; ++i) {
+        if (!send("AT+QXNOPE=probe\r")) return false;
+        if (!read_some(master, 1, 200).empty()) {
+            read_some(master, 1 << 16, 300);
+            return true;
+        }
+    }
+    return false;
+}
 
 speed_t Pty::speed() const {
     int fd = open(slave.c_str(), O_RDWR | O_NOCTTY);

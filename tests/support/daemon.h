@@ -29,6 +29,8 @@ struct Daemon {
     std::string log() const;
     int connect_tcp() const;
     int connect_local() const;
+    // A local client's line and the daemon's answer (it closes after one).
+    std::string ask_local(const std::string &line) const;
     // Sends a signal and returns the exit status (or 128+signal when killed by it).
     int stop(int sig);
 };
@@ -46,5 +48,7 @@ struct Pty {
     Pty &operator=(const Pty &) = delete;
 
     bool send(const std::string &s) const;
+    // Waits until the daemon serves the port (a probe line is answered), then drains.
+    bool ready() const;
     speed_t speed() const;
 };

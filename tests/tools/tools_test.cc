@@ -4,7 +4,6 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <netinet/in.h>
-#include <poll.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
@@ -27,6 +26,16 @@ namespace {
 const std::string kNotSupportedTcp = "AT+QXWLAN\r\n\r\n\"AT not support\"\r\nERROR\r\n";
 const std::string kNotSupportedBare = "AT+QXWLAN\r\n\"AT not support\"\r\nERROR\r\n";
 
+[[noreturn]] void exec(const std::vector<std::string> &argv) {
+    std::vector<char *> args;
+    for (const auto &a : argv) args.push_back(const_cast<char *>(a.c_str()));
+    args.push_back(nullptr);
+    execvp(args[0], args.data());
+    _exit(127);
+}
+
+int exit_status(int status) { return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status); }
+
 struct Outcome {
     int status = -1;
     std::string out;
@@ -41,25 +50,26 @@ Outcome run(const std::vector<std::string> &argv, const std::string &input = "")
         dup2(in[0], 0);
         dup2(out[1], 1);
         for (int fd : {in[0], in[1], out[0], out[1]}) close(fd);
-        std::vector<char *> args;
-        for (const auto &a : argv) args.push_back(const_cast<char *>(a.c_str()));
-        args.push_back(nullptr);
-        execvp(args[0], args.data());
-        _exit(127);
+        exec(argv);
     }
     close(in[0]);
     close(out[1]);
     signal(SIGPIPE, SIG_IGN);
-    ssize_t w = write(in[1], input.data(), input.size());
-    (void)w;
+    if (write(in[1], input.data(), input.size()) < 0) ADD_FAILURE() << "stdin not taken";
     close(in[1]);
     Outcome r;
     r.out = read_some(out[0], SIZE_MAX, 30000);
     close(out[0]);
     int status = 0;
     waitpid(pid, &status, 0);
-    r.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    r.status = exit_status(status);
     return r;
+}
+
+Outcome at(const std::vector<std::string> &args) {
+    std::vector<std::string> argv = {FTCMD_AT_BIN};
+    argv.insert(argv.end(), args.begin(), args.end());
+    return run(argv);
 }
 
 // One ftcmd-sim process; a test that fails half-way still ends it (and so its daemon).
@@ -71,25 +81,19 @@ struct Launcher {
     int out_fd = -1;
     std::string out;  // its stdout so far
 
-    Launcher(const std::string &root_dir, std::vector<std::string> extra = {}) : root(root_dir) {
+    explicit Launcher(const std::string &root_dir, std::vector<std::string> extra = {}) : root(root_dir) {
         local = "ftcmd_tools_test_" + std::to_string(getpid()) + "_" + std::to_string(port);
-        std::vector<std::string> argv = {FTCMD_SIM_BIN, "--root", root, "--port", std::to_string(port),
-                                         "--local", local};
+        std::vector<std::string> argv = {FTCMD_SIM_BIN, "--root", root, "--port", std::to_string(port), "--local", local};
         argv.insert(argv.end(), extra.begin(), extra.end());
         int p[2];
         if (pipe(p) != 0) return;
         pid = fork();
         if (pid == 0) {
             dup2(p[1], 1);
-            int log = open((root + ".log").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644);
-            dup2(log, 2);
+            dup2(open((root + ".log").c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644), 2);
             close(p[0]);
             close(p[1]);
-            std::vector<char *> args;
-            for (const auto &a : argv) args.push_back(const_cast<char *>(a.c_str()));
-            args.push_back(nullptr);
-            execv(args[0], args.data());
-            _exit(127);
+            exec(argv);
         }
         close(p[1]);
         out_fd = p[0];
@@ -100,35 +104,26 @@ struct Launcher {
     }
     bool wait_for(const std::string &text, int timeout_ms = 10000) {
         auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeout_ms);
-        while (out.find(text) == std::string::npos && std::chrono::steady_clock::now() < until) {
-            std::string more = read_some(out_fd, 1, 100);
-            out += more;
-        }
+        while (out.find(text) == std::string::npos && std::chrono::steady_clock::now() < until) out += read_some(out_fd, 1, 100);
         return out.find(text) != std::string::npos;
     }
     bool ready() { return wait_for("ftcmd-sim: ready\n"); }
-    int stop(int sig) {
-        kill(pid, sig);
+    // The exit status after sig, or the status it ended with by itself within timeout_ms.
+    int stop(int sig, int timeout_ms = 5000) {
+        if (sig != 0) kill(pid, sig);
         int status = 0;
-        for (int i = 0; i < 100 && waitpid(pid, &status, WNOHANG) == 0; ++i)
+        for (int i = 0; i < timeout_ms / 50 && waitpid(pid, &status, WNOHANG) == 0; ++i)
             std::this_thread::sleep_for(std::chrono::milliseconds(50));
         if (waitpid(pid, &status, WNOHANG) == 0) {
             kill(pid, SIGKILL);
             waitpid(pid, &status, 0);
         }
         pid = -1;
-        return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+        return exit_status(status);
     }
     std::string tcp() const { return "127.0.0.1:" + std::to_string(port); }
     std::string station(const char *port_name) const { return root + "/station/" + port_name; }
 };
-
-std::string read_file(const std::string &path) {
-    std::ifstream in(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(in), {});
-}
-
-// ---- the station tool over each channel
 
 enum class Via { Tcp, Local, Serial };
 
@@ -140,11 +135,11 @@ struct AtCase {
     std::string expected;
     int status;
 };
-
 void PrintTo(const AtCase &c, std::ostream *os) { *os << c.name; }
 
 class AtTest : public ::testing::TestWithParam<AtCase> {};
 
+// The station tool over each channel: raw and JSON output, stdin lines, the exit status.
 TEST_P(AtTest, PrintsTheFramesAndJudgesTheResults) {
     const AtCase &c = GetParam();
     Sandbox box;
@@ -160,6 +155,8 @@ TEST_P(AtTest, PrintsTheFramesAndJudgesTheResults) {
     EXPECT_EQ(r.status, c.status);
 }
 
+const std::string kJsonOk = "{\"line\": \"ATD112;\", \"echo\": \"ATD112;\", \"body\": \"\", \"result\": \"OK\"}\n";
+
 INSTANTIATE_TEST_SUITE_P(
     Station, AtTest,
     ::testing::Values(
@@ -169,31 +166,24 @@ INSTANTIATE_TEST_SUITE_P(
                "{\"line\": \"ATD112;\", \"echo\": \"ATD112;\\r\\n\", \"body\": \"\", \"result\": \"OK\"}\n", 0},
         AtCase{"TcpJsonStdin", Via::Tcp, {"--json"}, "AT+QXWLAN=1\n\nAT+QXWLAN\n",
                "{\"line\": \"AT+QXWLAN=1\", \"echo\": \"AT+QXWLAN=1\", \"body\": \"\", \"result\": \"Not Implement\"}\n"
-               "{\"line\": \"AT+QXWLAN\", \"echo\": \"AT+QXWLAN\", \"body\": \"\\\"AT not support\\\"\", "
-               "\"result\": \"ERROR\"}\n",
+               "{\"line\": \"AT+QXWLAN\", \"echo\": \"AT+QXWLAN\", \"body\": \"\\\"AT not support\\\"\", \"result\": \"ERROR\"}\n",
                1},
-        AtCase{"LocalOneAnswerPerConnection", Via::Local, {"--json", "ATD112;", "ATD112;"}, "",
-               "{\"line\": \"ATD112;\", \"echo\": \"ATD112;\", \"body\": \"\", \"result\": \"OK\"}\n"
-               "{\"line\": \"ATD112;\", \"echo\": \"ATD112;\", \"body\": \"\", \"result\": \"OK\"}\n",
-               0},
+        AtCase{"LocalOneAnswerPerConnection", Via::Local, {"--json", "ATD112;", "ATD112;"}, "", kJsonOk + kJsonOk, 0},
         AtCase{"SerialRaw", Via::Serial, {"AT+QXWLAN", "ATD112;"}, "", kNotSupportedBare + "ATD112;\r\nOK\r\n", 1},
         AtCase{"NoAnswerTimesOut", Via::Serial, {"--json", "--timeout", "0.5", "xyz"}, "",
                "{\"line\": \"xyz\", \"echo\": null, \"body\": null, \"result\": \"no answer\"}\n", 1}),
-    [](const ::testing::TestParamInfo<AtCase> &i) { return std::string(i.param.name); });
+    [](const auto &i) { return std::string(i.param.name); });
 
-// Frame shapes the current handlers do not produce yet, from a canned phone: it answers
-// the first line received with reply and keeps the connection until the station leaves.
 struct CannedCase {
     const char *name;
-    std::string reply;
-    std::vector<std::string> lines;
-    std::string expected;
+    std::string reply, expected;
 };
-
 void PrintTo(const CannedCase &c, std::ostream *os) { *os << c.name; }
 
 class CannedTest : public ::testing::TestWithParam<CannedCase> {};
 
+// Frame shapes the handlers do not produce yet, from a canned phone that answers the first
+// line with reply: an empty trailer ends on quiet, a frame for another line is unsolicited.
 TEST_P(CannedTest, SplitsFramesFromUnsolicitedLines) {
     const CannedCase &c = GetParam();
     int ls = socket(AF_INET, SOCK_STREAM, 0);
@@ -211,10 +201,8 @@ TEST_P(CannedTest, SplitsFramesFromUnsolicitedLines) {
         read_some(s, SIZE_MAX, 5000);  // until the station closes
         close(s);
     });
-    std::vector<std::string> argv = {FTCMD_AT_BIN, "--tcp", "127.0.0.1:" + std::to_string(ntohs(a.sin_port)),
-                                     "--json", "--crlf", "--timeout", "1"};
-    argv.insert(argv.end(), c.lines.begin(), c.lines.end());
-    EXPECT_EQ(run(argv).out, c.expected);
+    EXPECT_EQ(at({"--tcp", "127.0.0.1:" + std::to_string(ntohs(a.sin_port)), "--json", "--crlf", "--timeout", "1", "AT+QX=1"}).out,
+              c.expected);
     phone.join();
     close(ls);
 }
@@ -222,84 +210,71 @@ TEST_P(CannedTest, SplitsFramesFromUnsolicitedLines) {
 INSTANTIATE_TEST_SUITE_P(
     Station, CannedTest,
     ::testing::Values(
-        CannedCase{"EmptyTrailerEndsOnQuiet",
-                   "RING\r\nAT+QX=1\r\n\r\n\r\n\"v\"\r\n\r\n\r\n",
-                   {"AT+QX=1"},
+        CannedCase{"EmptyTrailerEndsOnQuiet", "RING\r\nAT+QX=1\r\n\r\n\r\n\"v\"\r\n\r\n\r\n",
                    "{\"unsolicited\": \"RING\\r\\n\"}\n"
-                   "{\"line\": \"AT+QX=1\", \"echo\": \"AT+QX=1\\r\\n\", \"body\": \"\\r\\n\\\"v\\\"\\r\\n\", "
-                   "\"result\": \"\"}\n"},
-        CannedCase{"StreamedFrameBeforeTheAnswer",
-                   "\xff\x01\r\nAT+QX=2\r\n\r\n1\r\nOK\r\nAT+QX=1\r\n\r\nx\r\ny\r\nATNG\r\n",
-                   {"AT+QX=1"},
+                   "{\"line\": \"AT+QX=1\", \"echo\": \"AT+QX=1\\r\\n\", \"body\": \"\\r\\n\\\"v\\\"\\r\\n\", \"result\": \"\"}\n"},
+        CannedCase{"StreamedFrameBeforeTheAnswer", "\xff\x01\r\nAT+QX=2\r\n\r\n1\r\nOK\r\nAT+QX=1\r\n\r\nx\r\ny\r\nATNG\r\n",
                    "{\"unsolicited\": \"\\u00ff\\u0001\\r\\nAT+QX=2\\r\\n\\r\\n1\\r\\nOK\\r\\n\"}\n"
                    "{\"line\": \"AT+QX=1\", \"echo\": \"AT+QX=1\\r\\n\", \"body\": \"x\\r\\ny\", \"result\": \"ATNG\"}\n"}),
-    [](const ::testing::TestParamInfo<CannedCase> &i) { return std::string(i.param.name); });
+    [](const auto &i) { return std::string(i.param.name); });
 
-TEST(Tools, RawOutputIsWhatNetcatReceives) {
+// A stock client on the serial station; a hang-up's frame reaches the station unasked;
+// a sequence set from the station changes the answers of the running phone, in order.
+TEST(Tools, StockClientHangUpAndSequencesOnARunningPhone) {
     Sandbox box;
     Launcher sim(box.root);
     ASSERT_TRUE(sim.ready()) << sim.out;
-    for (const char *ending : {"", "\r\n"}) {
-        Outcome nc = run({"nc", "-N", "127.0.0.1", std::to_string(sim.port)}, std::string("AT+QXWLAN") + ending);
-        std::vector<std::string> argv = {FTCMD_AT_BIN, "--tcp", sim.tcp(), "AT+QXWLAN"};
-        if (*ending) argv.insert(argv.begin() + 1, "--crlf");
-        Outcome at = run(argv);
-        EXPECT_EQ(nc.out, *ending ? kNotSupportedTcp : kNotSupportedBare);
-        EXPECT_EQ(at.out, nc.out);
-    }
-}
+    EXPECT_EQ(run({"socat", "-t1", "-", sim.station("ttyGS0") + ",raw,echo=0"}, "AT+QXWLAN\r").out, kNotSupportedBare);
+    // ^D at the start of a line ends the daemon's read: it reopens the port and runs its hang-up command.
+    Outcome hup = at({"--serial", sim.station("ttyGS0"), "--json", "--timeout", "1", "\x04", "ATD112;"});
+    EXPECT_NE(hup.out.find("{\"unsolicited\": \"AT+QXMT=1,0\\r\\n"), std::string::npos) << hup.out;
+    EXPECT_NE(hup.out.find("{\"line\": \"\\u0004\", \"echo\": null, \"body\": null, \"result\": \"no answer\"}\n"), std::string::npos);
+    EXPECT_NE(hup.out.find("\"echo\": \"ATD112;\", \"body\": \"\", \"result\": \"OK\"}\n"), std::string::npos);
 
-TEST(Tools, SerialStationSurvivesAHangUp) {
-    Sandbox box;
-    Launcher sim(box.root);
-    ASSERT_TRUE(sim.ready()) << sim.out;
-    Outcome socat = run({"socat", "-t1", "-", sim.station("ttyGS0") + ",raw,echo=0"}, "AT+QXWLAN\r");
-    EXPECT_EQ(socat.out, kNotSupportedBare);
-    // ^D at the start of a line ends the daemon's read: it reopens the port and runs its
-    // hang-up command, whose frame reaches the station unasked.
-    Outcome at = run({FTCMD_AT_BIN, "--serial", sim.station("ttyGS0"), "--json", "--timeout", "1", "\x04", "ATD112;"});
-    EXPECT_NE(at.out.find("{\"unsolicited\": \"AT+QXMT=1,0\\r\\n"), std::string::npos) << at.out;
-    EXPECT_NE(at.out.find("{\"line\": \"\\u0004\", \"echo\": null, \"body\": null, \"result\": \"no answer\"}\n"),
-              std::string::npos)
-        << at.out;
-    EXPECT_NE(at.out.find("\"echo\": \"ATD112;\", \"body\": \"\", \"result\": \"OK\"}\n"), std::string::npos);
+    box.write("/.sim/events.log", "");
+    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "seq", "testapp:emerg_call", "busy", "ok"}).status, 0);
+    for (const char *frame : {"ATD112;\r\nERROR\r\n", "ATD112;\r\nOK\r\n", "ATD112;\r\nOK\r\n"})
+        EXPECT_EQ(at({"--tcp", sim.tcp(), "ATD112;"}).out, frame);
+    std::vector<Event> messages;
+    for (const auto &e : box.event_list())
+        if (e.kind == "message") messages.push_back(e);
+    ASSERT_EQ(messages.size(), 3u);
+    EXPECT_EQ(messages[0].detail, "emerg_call -> busy");
+    EXPECT_EQ(messages[2].detail, "emerg_call -> ok");
+    EXPECT_TRUE(messages[0].ms <= messages[1].ms && messages[1].ms <= messages[2].ms);
 }
-
-// ---- the launcher
 
 struct ModeCase {
     const char *name;
     std::vector<std::string> args;
     const char *flags;    // the mode line
-    const char *cmdline;  // expected in proc/cmdline ("" : no console-at key at all)
+    const char *cmdline;  // expected in proc/cmdline ("": no console-at key at all)
     bool uart;
     int enters_assembly;  // -1: not checked
 };
-
 void PrintTo(const ModeCase &c, std::ostream *os) { *os << c.name; }
 
 class ModeTest : public ::testing::TestWithParam<ModeCase> {};
 
+// The launcher replaces only the console-at key of an earlier boot's command line and
+// links a UART station only in the modes that serve it.
 TEST_P(ModeTest, WritesTheCommandLineAndServesTheUartOnlyWhenUsed) {
     const ModeCase &c = GetParam();
     Sandbox box;
-    // Left over from an earlier boot: another mode, and assembly mode running.
     box.write("/proc/cmdline", "console=ttyMSM0,115200n8 console-at=sendNormal loop.max_part=7\n");
-    box.set_prop("sys.factory.assembly_at_mode", "2");
+    box.set_prop("sys.factory.assembly_at_mode", "2");  // assembly mode was running
     Launcher sim(box.root, c.args);
     ASSERT_TRUE(sim.ready()) << sim.out;
     EXPECT_NE(sim.out.find(std::string("ftcmd-sim: mode ") + c.flags + "\n"), std::string::npos) << sim.out;
     std::string cmdline = box.read("/proc/cmdline");
-    std::string expected = *c.cmdline ? c.cmdline : "console=ttyMSM0,115200n8 loop.max_part=7\n";
-    EXPECT_NE(cmdline.find(expected), std::string::npos) << cmdline;
+    EXPECT_NE(cmdline.find(*c.cmdline ? c.cmdline : "console=ttyMSM0,115200n8 loop.max_part=7\n"), std::string::npos) << cmdline;
     EXPECT_EQ(fs::is_symlink(sim.station("ttyMSM0")), c.uart);
     EXPECT_EQ(sim.out.find("ftcmd-sim: uart /dev/pts/") != std::string::npos, c.uart);
     if (c.uart) {
-        EXPECT_EQ(run({FTCMD_AT_BIN, "--serial", sim.station("ttyMSM0"), "AT+QXWLAN"}).out, kNotSupportedBare);
+        EXPECT_EQ(at({"--serial", sim.station("ttyMSM0"), "AT+QXWLAN"}).out, kNotSupportedBare);
     }
     if (c.enters_assembly >= 0) {
-        EXPECT_EQ(box.events().find("setprop sys.factory.assembly_at_mode=1") != std::string::npos,
-                  c.enters_assembly == 1);
+        EXPECT_EQ(box.events().find("setprop sys.factory.assembly_at_mode=1") != std::string::npos, c.enters_assembly == 1);
     }
 }
 
@@ -309,13 +284,12 @@ INSTANTIATE_TEST_SUITE_P(
         ModeCase{"Plain", {"--mode", "plain"}, "plain (is_uart_flag 0, is_sp 0)", "", false, -1},
         ModeCase{"At", {"--mode", "at"}, "at (is_uart_flag 1, is_sp 1)", " console-at=sendAT\n", true, -1},
         ModeCase{"Normal", {"--mode", "normal"}, "normal (is_uart_flag 1, is_sp 0)", " console-at=sendNormal\n", true, -1},
-        ModeCase{"AssemblyNewBoot", {"--mode", "assembly"}, "assembly (is_uart_flag 0, is_sp 1)",
-                 " console-at=sendAT_assembly\n", false, 1},
+        ModeCase{"AssemblyNewBoot", {"--mode", "assembly"}, "assembly (is_uart_flag 0, is_sp 1)", " console-at=sendAT_assembly\n", false, 1},
         ModeCase{"AssemblySameBoot", {"--mode", "assembly", "--keep-boot"}, "assembly (is_uart_flag 0, is_sp 1)",
                  " console-at=sendAT_assembly\n", false, 0},
         ModeCase{"WholeCommandLine", {"--cmdline", "quiet console-at=sendAT"}, "at (is_uart_flag 1, is_sp 1)",
                  "quiet console-at=sendAT\n", true, -1}),
-    [](const ::testing::TestParamInfo<ModeCase> &i) { return std::string(i.param.name); });
+    [](const auto &i) { return std::string(i.param.name); });
 
 TEST(Tools, TwoPhonesSideBySideStopOnTheirSignals) {
     Sandbox box;
@@ -323,14 +297,13 @@ TEST(Tools, TwoPhonesSideBySideStopOnTheirSignals) {
     Launcher b(box.dir + "/second");  // made from the device tree
     ASSERT_TRUE(a.ready()) << a.out;
     ASSERT_TRUE(b.ready()) << b.out;
-    for (Launcher *sim : {&a, &b}) EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim->tcp(), "ATD112;"}).status, 0);
-    EXPECT_EQ(run({FTCMD_AT_BIN, "--local", b.local, "ATD112;"}).status, 0);
+    for (Launcher *sim : {&a, &b}) EXPECT_EQ(at({"--tcp", sim->tcp(), "ATD112;"}).status, 0);
+    EXPECT_EQ(at({"--local", b.local, "ATD112;"}).status, 0);
     EXPECT_EQ(a.stop(SIGTERM), 15);
     EXPECT_EQ(b.stop(SIGINT), 2);
     EXPECT_FALSE(fs::exists(fs::symlink_status(box.root + "/dev/ttyGS0")));
     EXPECT_FALSE(fs::exists(fs::symlink_status(box.dir + "/second/station/ttyGS0")));
-    // Both phones have gone: nothing listens on their ports any more.
-    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", a.tcp(), "ATD112;"}).status, 2);
+    EXPECT_EQ(at({"--tcp", a.tcp(), "ATD112;"}).status, 2);  // nothing listens any more
 }
 
 TEST(Tools, FreshEmptiesOnlyASandbox) {
@@ -340,8 +313,9 @@ TEST(Tools, FreshEmptiesOnlyASandbox) {
     std::ofstream(other + "/keep") << "mine";
     EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", other, "--fresh"}).status, 2);
     EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", other}).status, 2);
-    EXPECT_EQ(read_file(other + "/keep"), "mine");
-
+    std::string kept;
+    std::ifstream(other + "/keep") >> kept;
+    EXPECT_EQ(kept, "mine");
     box.write("/data/leftover", "x");
     Launcher sim(box.root, {"--fresh"});
     ASSERT_TRUE(sim.ready()) << sim.out;
@@ -349,62 +323,34 @@ TEST(Tools, FreshEmptiesOnlyASandbox) {
     EXPECT_TRUE(box.exists("/.sim/testapp.replies"));
 }
 
-// ---- supervision and station commands
-
-// A line that ends the daemon: the emergency-call frame has no room for it.
-const std::string kFatalLine = "ATD112;" + std::string(115, 'x');
-
-TEST(Tools, ADaemonThatEndsIsRestartedAndAnswersAgain) {
+// A line that ends the daemon (the emergency-call frame has no room for it): the launcher
+// restarts it, or with --no-restart ends with its status.
+TEST(Tools, ADaemonThatEndsIsRestartedUnlessToldNot) {
+    const std::string fatal = "ATD112;" + std::string(115, 'x');
     Sandbox box;
     Launcher sim(box.root);
     ASSERT_TRUE(sim.ready()) << sim.out;
-    run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "--timeout", "2", kFatalLine});
+    at({"--tcp", sim.tcp(), "--timeout", "2", fatal});
     ASSERT_TRUE(sim.wait_for("ftcmd-sim: restarting the daemon (restart 1)\n")) << sim.out;
     EXPECT_NE(sim.out.find("ftcmd-sim: daemon exited with status 6\n"), std::string::npos) << sim.out;
     sim.out.clear();
     ASSERT_TRUE(sim.ready()) << sim.out;
-    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "AT+QXWLAN"}).out, kNotSupportedBare);
+    EXPECT_EQ(at({"--tcp", sim.tcp(), "AT+QXWLAN"}).out, kNotSupportedBare);
     EXPECT_NE(box.events().find("init ftcmd: daemon exited with status 6; restart 1\n"), std::string::npos) << box.events();
     EXPECT_EQ(sim.stop(SIGINT), 2);  // Ctrl-C still ends both
+
+    Sandbox box2;
+    Launcher once(box2.root, {"--no-restart"});
+    ASSERT_TRUE(once.ready()) << once.out;
+    at({"--tcp", once.tcp(), "--timeout", "2", fatal});
+    EXPECT_EQ(once.stop(0, 10000), 6);
+    EXPECT_EQ(box2.events().find("init "), std::string::npos);
 }
 
-TEST(Tools, NoRestartEndsWithTheDaemonsStatus) {
-    Sandbox box;
-    Launcher sim(box.root, {"--no-restart"});
-    ASSERT_TRUE(sim.ready()) << sim.out;
-    run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "--timeout", "2", kFatalLine});
-    int status = 0;
-    for (int i = 0; i < 200 && waitpid(sim.pid, &status, WNOHANG) == 0; ++i)
-        std::this_thread::sleep_for(std::chrono::milliseconds(50));
-    ASSERT_TRUE(WIFEXITED(status)) << sim.out;
-    EXPECT_EQ(WEXITSTATUS(status), 6);
-    sim.pid = -1;
-    EXPECT_EQ(box.events().find("init "), std::string::npos);
-}
-
-TEST(Tools, SequencesSetFromTheStationChangeAnswersWhileRunning) {
-    Sandbox box;
-    Launcher sim(box.root);
-    ASSERT_TRUE(sim.ready()) << sim.out;
-    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "seq", "testapp:emerg_call", "busy", "ok"}).status, 0);
-    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "ATD112;"}).out, "ATD112;\r\nERROR\r\n");
-    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "ATD112;"}).out, "ATD112;\r\nOK\r\n");
-    EXPECT_EQ(run({FTCMD_AT_BIN, "--tcp", sim.tcp(), "ATD112;"}).out, "ATD112;\r\nOK\r\n");
-    // The three messages are in the record, in order of time.
-    std::vector<Event> messages;
-    for (const auto &e : box.event_list())
-        if (e.kind == "message") messages.push_back(e);
-    ASSERT_EQ(messages.size(), 3u);
-    EXPECT_EQ(messages[0].detail, "emerg_call -> busy");
-    EXPECT_EQ(messages[2].detail, "emerg_call -> ok");
-    EXPECT_LE(messages[0].ms, messages[1].ms);
-    EXPECT_LE(messages[1].ms, messages[2].ms);
-}
-
+// Nothing reads the input devices: the station is told (1); a bad key code is refused (2).
 TEST(Tools, StationInjectsKeysIntoAnOpenDevice) {
     Sandbox box;
     box.activate();
-    // Nothing reads the input devices: the station is told so.
     EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "key", "115"}).status, 1);
     int fd = dev::open("/dev/input/event1", O_RDONLY);  // this process stands in for the daemon
     ASSERT_GE(fd, 0);
@@ -413,7 +359,7 @@ TEST(Tools, StationInjectsKeysIntoAnOpenDevice) {
     ASSERT_EQ(got.size(), 48u);
     EXPECT_EQ(got.substr(16, 8), std::string("\x01\x00\x73\x00\x01\x00\x00\x00", 8));  // EV_KEY 115 pressed
     EXPECT_EQ(got.substr(40, 8), std::string(8, '\0'));                                     // the report
-    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "key", "volume"}).status, 2);  // not a key code
+    EXPECT_EQ(run({FTCMD_SIM_BIN, "--root", box.root, "key", "volume"}).status, 2);
     close(fd);
 }
 
