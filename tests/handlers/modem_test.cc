@@ -7,9 +7,7 @@
 
 namespace {
 
-std::string nv_pattern() {  // every byte non-zero, so a stray write shows
-    return nv_fill(0x21, 191);
-}
+std::string nv_pattern() { return nv_fill(0x21, 191); }  // every byte non-zero, so a stray write shows
 std::string with_i32(std::string nv, size_t off, int32_t v) { return nv.replace(off, 4, reinterpret_cast<const char *>(&v), 4); }
 
 struct Case {
@@ -39,9 +37,9 @@ protected:
         box.write("/.sim/nv.bin", nv_pattern());
         box.write("/.sim/events.log", "");
     }
-    std::string answer_of(const std::string &line, const std::string &body, const std::string &word) {
-        const std::string want = line + "\r\n" + body + "\r\n" + word + "\r\n";
-        return serve(line, SRC_TCP, want.size());
+    void served(const std::string &line, const std::string &body, const std::string &word) {
+        const std::string want = frame(line, body, word);
+        EXPECT_EQ(serve(line, SRC_TCP, want.size()), want);
     }
 };
 class ModemLine : public Modem, public ::testing::WithParamInterface<Case> {};
@@ -53,12 +51,13 @@ TEST_P(ModemLine, Answers) {
     box.write("/.sim/modem", script + box.read("/.sim/modem"));
     if (!c.project.empty()) box.write("/.sim/config", "project=" + c.project + "\n" + box.read("/.sim/config"));
     if (c.fault) box.fault(c.fault);
-    EXPECT_EQ(answer_of(c.line, c.body, c.word), c.line + "\r\n" + c.body + "\r\n" + c.word + "\r\n");
+    served(c.line, c.body, c.word);
     EXPECT_EQ(rf_records(box.events()), c.records);
     EXPECT_EQ(box.read("/.sim/nv.bin"), nv_pattern());
 }
 
 const std::string kEm = "modem em_status ";
+const auto by_name = [](const auto &i) { return std::string(i.param.name); };
 
 INSTANTIATE_TEST_SUITE_P(Dpdt, ModemLine, ::testing::Values(
     Case{"Main", "AT+QXDPDT=0", {}, "", nullptr, "", "OK", {kEm + "110 -> 0"}},
@@ -96,7 +95,7 @@ INSTANTIATE_TEST_SUITE_P(Dpdt, ModemLine, ::testing::Values(
     Case{"SmartAntennaOtherForm", "AT+QXSMT_DEFAULT_ANT=0", {}, "", nullptr, "", "ERROR", {}},
     Case{"AntDefHasNoForm", "AT+QX_ANT_DEF=1", {}, "", nullptr, "", "ERROR", {}},
     Case{"Unknown", "AT+QXDPDT=11", {}, "", nullptr, "", "ERROR", {}}),
-    [](const auto &i) { return std::string(i.param.name); });
+    by_name);
 
 INSTANTIATE_TEST_SUITE_P(DiversityAndSar, ModemLine, ::testing::Values(
     Case{"DrxOff", "AT+QX_DRX_OPT=0", {}, "", nullptr, "", "ATOK", {kEm + "150 -> 0"}},
@@ -109,17 +108,17 @@ INSTANTIATE_TEST_SUITE_P(DiversityAndSar, ModemLine, ::testing::Values(
     Case{"SarOff", "AT+QXSAR=0", {}, "", nullptr, "", "OK", {kEm + "210 -> 0"}},
     Case{"SarOnRefused", "AT+QXSAR=1", {"em.211=1"}, "", nullptr, "", "ERROR", {kEm + "211 -> 1"}},
     Case{"SarUnknown", "AT+QXSAR=2", {}, "", nullptr, "", "ERROR", {}}),
-    [](const auto &i) { return std::string(i.param.name); });
+    by_name);
 
 TEST_F(Modem, DpdtCrossIsRecordedByBothSwitchForms) {
     for (const char *line : {"AT+QXDPDT=2", "AT+QXDPDT=3"}) {
         box.set_prop("persist.sys.dpdt", "");
-        EXPECT_EQ(answer_of(line, "", "OK"), std::string(line) + "\r\n\r\nOK\r\n");
+        served(line, "", "OK");
         EXPECT_EQ(box.prop("persist.sys.dpdt"), "cross") << line;
     }
     box.set_prop("persist.sys.dpdt", "normal");
     box.fault("dpdt");
-    EXPECT_EQ(answer_of("AT+QXDPDT=2", "", "ERROR"), "AT+QXDPDT=2\r\n\r\nERROR\r\n");
+    served("AT+QXDPDT=2", "", "ERROR");
     EXPECT_EQ(box.prop("persist.sys.dpdt"), "normal");
 }
 
@@ -129,7 +128,7 @@ struct ServiceCase {
     int32_t adb_field;
     const char *fault;
     const char *word;
-    bool written, started;
+    bool written, started;  // the NV flag (the service then always starts)
 };
 class DpdtService : public Modem, public ::testing::WithParamInterface<ServiceCase> {};
 
@@ -138,12 +137,11 @@ TEST_P(DpdtService, StartsTheService) {
     const std::string before = with_i32(nv_pattern(), 12, c.adb_field);
     box.write("/.sim/nv.bin", before);
     if (c.fault) box.fault(c.fault);
-    EXPECT_EQ(answer_of("AT+QXDPDT=5", "", c.word), std::string("AT+QXDPDT=5\r\n\r\n") + c.word + "\r\n");
+    served("AT+QXDPDT=5", "", c.word);
     EXPECT_EQ(box.read("/.sim/nv.bin"), c.written ? with_i32(before, 104, 1) : before);
-    std::vector<std::string> want;
-    if (c.written) want.push_back("nv write");
-    if (c.started) want.push_back("service-start com.pyxa.engineermode/.DpdtService  ");
-    EXPECT_EQ(rf_records(box.events()), want);
+    const std::string start = "service-start com.pyxa.engineermode/.DpdtService  ";
+    using Lines = std::vector<std::string>;
+    EXPECT_EQ(rf_records(box.events()), (c.written ? Lines{"nv write", start} : c.started ? Lines{start} : Lines{}));
 }
 
 INSTANTIATE_TEST_SUITE_P(Dpdt, DpdtService, ::testing::Values(
@@ -152,6 +150,6 @@ INSTANTIATE_TEST_SUITE_P(Dpdt, DpdtService, ::testing::Values(
     ServiceCase{"FieldThreeOnlyStarts", 3, nullptr, "OK", false, true},
     ServiceCase{"ReadFails", 1, "nv-read", "ERROR", false, false},
     ServiceCase{"WriteFails", 1, "nv-write", "ERROR", false, false}),
-    [](const auto &i) { return std::string(i.param.name); });
+    by_name);
 
 }  // namespace
