@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <chrono>
 #include <filesystem>
+#include <functional>
 #include <thread>
 
 #include "platform/sim/chardev.h"
@@ -18,7 +19,7 @@ const std::string kReset = "in 20 00 01 00", kInit10 = "in 20 01 00", kInit20 = 
                   kSwpTest = "in 2F 3E 01 00", kPollMode = "in 20 02 05 01 A0 44 01 00",
                   kListen1 = "in 20 02 0F 01 A0 0E 0B 11 01 C2 B2 00 B2 1E 1F 00 D0 0C",
                   kListen2 = "in 20 02 05 01 A0 03 01 08", kDiscover = "in 21 03 09 04 00 01 01 01 02 01 81 01";
-const std::string kCplc(84, 'A');
+const std::string kCplc(84, 'A'), kId = "\r\n\"0a1b2c3d\"\r\n";
 const char *kChipType = "persist.kael.nfc.chip.type";
 
 using Lines = std::vector<std::string>;
@@ -30,8 +31,9 @@ Lines cat(std::initializer_list<Lines> parts) {
 // One controller cycle: opened, power-cycled, the exchange, powered off and closed.
 Lines cycle(const Lines &exchange) { return cat({{"open", "power 0", "power 1"}, exchange, {"power 0", "close"}}); }
 const Lines kV10 = {kReset, kInit10, kActivate}, kV20 = {kReset, kInit20, kActivate};
-const Lines kTagRead = {kPollMode, kDiscover}, kCard = {kPollMode, kListen1, kListen2, kDiscover};
-const Lines kSelfTest = {kSwpEnable, kSwpTest};
+const Lines kRead10 = cycle(cat({kV10, {kPollMode, kDiscover}})), kRead20 = cycle(cat({kV20, {kPollMode, kDiscover}}));
+const Lines kChk10 = cycle(cat({kV10, {kSwpEnable, kSwpTest}})), kChk20 = cycle(cat({kV20, {kSwpEnable, kSwpTest}}));
+const Lines kCard10 = cycle(cat({kV10, {kPollMode, kListen1, kListen2, kDiscover}})), kIc = cycle({kReset});
 
 std::string quoted(const std::string &v) { return "\r\n\"" + v + "\"\r\n"; }
 
@@ -42,19 +44,19 @@ void nfc_script(const Sandbox &b, const Lines &lines) {
     b.write("/.sim/nfc", text + b.read("/.sim/nfc"));
 }
 
-using Setup = void (*)(const Sandbox &);
+using Setup = std::function<void(const Sandbox &)>;
+Setup rep(const char *message, const char *reply) { return [=](const Sandbox &b) { b.reply(message, reply); }; }
+Setup fault(const char *name) { return [=](const Sandbox &b) { b.fault(name); }; }
+Setup chip(const char *type) { return [=](const Sandbox &b) { b.set_prop(kChipType, type); }; }
+Setup project(const char *name) { return [=](const Sandbox &b) { b.sequence("config:project", {name}); }; }
 void absent(const Sandbox &b) { std::filesystem::remove(b.path("/dev/nq-nci")); }
-void refuse(const Sandbox &b) { b.fault("testapp-refuse"); }
-void silent_app(const Sandbox &b) { b.fault("testapp-silent"); }
+void at_mode(const Sandbox &) { is_sp = 1; }
+const Setup refuse = fault("testapp-refuse"), silent = fault("testapp-silent");
 void nfc_on(const Sandbox &b) { b.sequence("testapp:nfc_test c", {"1", "1", "0"}); }
 void nfc_on_refuses(const Sandbox &b) {
     b.reply("nfc_test c", "1");
     b.reply("nfc_test 0", "error");
 }
-void project_61(const Sandbox &b) { b.sequence("config:project", {"RX6101"}); }
-void project_rt(const Sandbox &b) { b.sequence("config:project", {"RT6202"}); }
-void chip_sn100(const Sandbox &b) { b.set_prop(kChipType, "SN100"); }
-void chip_sn1000(const Sandbox &b) { b.set_prop(kChipType, "SN1000"); }
 
 struct Case {
     const char *name;
@@ -63,17 +65,20 @@ struct Case {
     Setup setup;
     std::string body;
     const char *word;
-    Lines nfc;           // the controller's record without its answers, exactly
+    Lines nfc;               // the controller's record without its answers, exactly
     Lines messages = {"*"};  // test-app messages, exactly and in this order ("*": not checked)
 };
 std::string case_name(const ::testing::TestParamInfo<Case> &info) { return info.param.name; }
 
+long long ms_since(std::chrono::steady_clock::time_point t0) {
+    return std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() - t0).count();
+}
+
 class Nfc : public InProcess {
 protected:
-    int saved_sp = 0;
+    int saved_sp = is_sp;
     void SetUp() override {
         InProcess::SetUp();
-        saved_sp = is_sp;
         is_sp = 0;
     }
     void TearDown() override {
@@ -81,29 +86,28 @@ protected:
         is_sp = saved_sp;
         InProcess::TearDown();
     }
-    // The controller's record once every open has been closed (the device thread records
-    // the close a moment after the daemon's close).
-    Lines record(bool answers = false) const {
-        all_closed();
-        return raw_record(answers);
+    void expect_frame(const std::string &line, const std::string &body, const char *word) {
+        const std::string want = frame(line, body, word);
+        EXPECT_EQ(serve(line, SRC_TCP, want.size()), want);
     }
-    Lines raw_record(bool answers = false) const {
+    // The details of one kind of event, without the controller's answers and CPLC reads.
+    Lines of(const char *kind, bool answers = false) const {
         Lines out;
         for (const auto &e : box.event_list())
-            if (e.kind == "nfc" && e.detail.rfind("getCPLC", 0) != 0 && (answers || e.detail.rfind("out ", 0) != 0))
+            if (e.kind == kind && e.detail.rfind("getCPLC", 0) != 0 && (answers || e.detail.rfind("out ", 0) != 0))
                 out.push_back(e.detail);
         return out;
     }
-    Lines messages() const {
-        Lines out;
-        for (const auto &e : box.event_list())
-            if (e.kind == "message") out.push_back(e.detail);
-        return out;
+    // The controller's record once every open is closed (the device thread records the close
+    // a moment after the daemon's).
+    Lines record(bool answers = false) const {
+        all_closed();
+        return of("nfc", answers);
     }
     // A worker left running holds its open until it ends: wait (bounded) until it has.
     bool all_closed(int ms = 5000) const {
         for (int waited = 0;; waited += 20) {
-            Lines r = raw_record();
+            Lines r = of("nfc");
             if (std::count(r.begin(), r.end(), "open") == std::count(r.begin(), r.end(), "close")) return true;
             if (waited >= ms) return false;
             std::this_thread::sleep_for(std::chrono::milliseconds(20));
@@ -114,6 +118,21 @@ protected:
             if (e.kind == "nfc" && e.detail == detail && --nth == 0) return e.ms;
         return -1;
     }
+    // No tag or no reader: "timeout 2s" once the 2-second window from the power-up has passed;
+    // then the next command (script then) opens the controller afresh and answers body.
+    void times_out(const std::string &line, const Lines &script, const Lines &cycle, const Lines &then,
+                   const std::string &body) {
+        nfc_script(box, script);
+        const auto t0 = std::chrono::steady_clock::now();
+        expect_frame(line, quoted("timeout 2s"), "ERROR");
+        EXPECT_GE(ms_since(t0), 1950);
+        EXPECT_EQ(record(), cycle);
+        const long long window = at("power 0", 2) - at("power 1");
+        EXPECT_GE(window, 1950) << box.events();
+        EXPECT_LT(window, 2600) << box.events();
+        nfc_script(box, then);
+        expect_frame(line, body, "OK");
+    }
 };
 class NfcLine : public Nfc, public ::testing::WithParamInterface<Case> {};
 
@@ -121,12 +140,11 @@ TEST_P(NfcLine, Answers) {
     const Case &c = GetParam();
     nfc_script(box, c.script);
     if (c.setup) c.setup(box);
-    const std::string want = frame(c.line, c.body, c.word);
-    EXPECT_EQ(serve(c.line, SRC_TCP, want.size()), want);
+    expect_frame(c.line, c.body, c.word);
     ASSERT_TRUE(all_closed()) << box.events();
     EXPECT_EQ(record(), c.nfc) << box.events();
     if (c.messages != Lines{"*"}) {
-        EXPECT_EQ(messages(), c.messages);
+        EXPECT_EQ(of("message"), c.messages);
     }
 }
 
@@ -134,175 +152,121 @@ INSTANTIATE_TEST_SUITE_P(TestApp, NfcLine, ::testing::Values(
     Case{"On", "AT+QXNFC=1,1", {}, nullptr, "", "OK", {}, {"nfc_test 1 -> ok"}},
     Case{"OnRefused", "AT+QXNFC=1,1", {}, refuse, "", "ERROR", {}, {"nfc_test 1 -> error"}},
     Case{"On2", "AT+QXNFC=1,2", {}, nullptr, "", "OK", {}, {"nfc_test 2 -> ok"}},
-    Case{"On2Silent", "AT+QXNFC=1,2", {}, silent_app, "", "ATERROR", {}, {"nfc_test 2 -> (silent)"}},
+    Case{"On2Silent", "AT+QXNFC=1,2", {}, silent, "", "ATERROR", {}, {"nfc_test 2 -> (silent)"}},
     Case{"Off", "AT+QXNFC=1,0", {}, nullptr, "", "OK", {}, {"nfc_test 0 -> ok"}},
     Case{"OffRefused", "AT+QXNFC=1,0", {}, refuse, "", "ATERROR", {}},
-    Case{"State", "AT+QXNFC=0", {}, [](const Sandbox &b) { b.reply("nfc_test c", "1"); }, quoted("1"), "OK", {}},
+    Case{"State", "AT+QXNFC=0", {}, rep("nfc_test c", "1"), quoted("1"), "OK", {}},
     Case{"StateError", "AT+QXNFC=0", {}, refuse, "", "ERROR", {}, {"nfc_test c -> error"}},
-    Case{"StateSilent", "AT+QXNFC=0", {}, silent_app, "", "ERROR", {}},
-    Case{"Cplc3", "AT+QXNFC=3", {}, [](const Sandbox &b) { b.reply("nfc_test cplc", "9F7F2A4790"); }, quoted("9F7F2A4790"),
-         "OK", {}, {"nfc_test cplc -> 9F7F2A4790"}},
-    Case{"Cplc3Error", "AT+QXNFC=3", {}, refuse, "", "ERROR", {}},
-    Case{"CplcRead", "AT+QX_NFC_CPLC=0", {}, [](const Sandbox &b) { b.reply("nfc_test cplc", "9F7F2A"); }, "\"9F7F2A\"",
-         "ATOK", {}},
-    Case{"CplcNotSupported", "AT+QX_NFC_CPLC=0", {}, [](const Sandbox &b) { b.reply("nfc_test cplc", "not support"); },
-         "", "ERROR", {}},
+    Case{"StateSilent", "AT+QXNFC=0", {}, silent, "", "ERROR", {}},
+    Case{"Cplc3", "AT+QXNFC=3", {}, rep("nfc_test cplc", "9F7F2A4790"), quoted("9F7F2A4790"), "OK", {},
+         {"nfc_test cplc -> 9F7F2A4790"}},
+    Case{"CplcRead", "AT+QX_NFC_CPLC=0", {}, rep("nfc_test cplc", "9F7F2A"), "\"9F7F2A\"", "ATOK", {}},
+    Case{"CplcNotSupported", "AT+QX_NFC_CPLC=0", {}, rep("nfc_test cplc", "not support"), "", "ERROR", {}},
     Case{"CplcReadError", "AT+QX_NFC_CPLC=0", {}, refuse, "\"error\"", "ATNG", {}},
-    Case{"CplcReadSilent", "AT+QX_NFC_CPLC=0", {}, silent_app, "\"\"", "ATNG", {}},
+    Case{"CplcReadSilent", "AT+QX_NFC_CPLC=0", {}, silent, "\"\"", "ATNG", {}},
     Case{"Spi", "AT+QX_NFC_SPI=1", {}, nullptr, "", "ATOK", {}, {}},
-    Case{"SpiFails", "AT+QX_NFC_SPI=1", {}, [](const Sandbox &b) { b.fault("cplc"); }, "", "ATNG", {}},
-    Case{"CplcCheck", "AT+QX_NFC_CPLC=1," + kCplc, {}, [](const Sandbox &b) { b.reply("nfc_test card", "0,pass"); },
-         "\"0,pass\"", "ATOK", {}, {"nfc_test card -> 0,pass"}},
-    Case{"CplcCheckQuoted", "AT+QX_NFC_CPLC=1,\" " + kCplc + "\"", {}, [](const Sandbox &b) { b.reply("nfc_test card", "0"); },
-         "\"0\"", "ATOK", {}, {"nfc_test card -> 0"}},
-    Case{"CplcCheckFails", "AT+QX_NFC_CPLC=1," + kCplc, {}, [](const Sandbox &b) { b.reply("nfc_test card", "1"); },
-         "\"1\"", "ATNG", {}},
-    Case{"CplcCheckSilent", "AT+QX_NFC_CPLC=1," + kCplc, {}, silent_app, "\"\"", "ATNG", {}},
+    Case{"SpiFails", "AT+QX_NFC_SPI=1", {}, fault("cplc"), "", "ATNG", {}},
+    Case{"CplcCheck", "AT+QX_NFC_CPLC=1," + kCplc, {}, rep("nfc_test card", "0,pass"), "\"0,pass\"", "ATOK", {},
+         {"nfc_test card -> 0,pass"}},
+    Case{"CplcCheckQuoted", "AT+QX_NFC_CPLC=1,\" " + kCplc + "\"", {}, rep("nfc_test card", "0"), "\"0\"", "ATOK", {}},
+    Case{"CplcCheckFails", "AT+QX_NFC_CPLC=1," + kCplc, {}, rep("nfc_test card", "1"), "\"1\"", "ATNG", {}},
+    Case{"CplcCheckSilent", "AT+QX_NFC_CPLC=1," + kCplc, {}, silent, "\"\"", "ATNG", {}},
     Case{"Cplc83", "AT+QX_NFC_CPLC=1," + kCplc.substr(1), {}, nullptr, "\"1\"", "ATNG", {}, {}},
     Case{"Cplc85", "AT+QX_NFC_CPLC=1," + kCplc + "0", {}, nullptr, "\"1\"", "ATNG", {}, {}},
     Case{"CplcNotHex", "AT+QX_NFC_CPLC=1," + kCplc.substr(1) + "G", {}, nullptr, "\"1\"", "ATNG", {}, {}},
     Case{"CplcThirdFieldIgnored", "AT+QX_NFC_CPLC=1,," + kCplc + ",x", {}, nullptr, "\"ok\"", "ATNG", {}},
-    Case{"CplcMissing", "AT+QX_NFC_CPLC=1", {}, nullptr, "", "ATERROR", {}, {}},
-    Case{"CplcEmptyField", "AT+QX_NFC_CPLC=1,", {}, nullptr, "", "ATERROR", {}},
-    Case{"CalChip", "AT+QX_NFC_CAL=0", {}, [](const Sandbox &b) { b.set_prop(kChipType, "S3NRN82"); }, "\"1\"", "ATOK", {}},
-    Case{"CalOtherChip", "AT+QX_NFC_CAL=0", {}, chip_sn100, "\"0\"", "ATOK", {}},
-    Case{"CalNoChip", "AT+QX_NFC_CAL=0", {}, nullptr, "\"0\"", "ATOK", {}},
+    Case{"CplcEmptyField", "AT+QX_NFC_CPLC=1,", {}, nullptr, "", "ATERROR", {}, {}},
+    Case{"CalChip", "AT+QX_NFC_CAL=0", {}, chip("S3NRN82"), "\"1\"", "ATOK", {}},
+    Case{"CalOtherChip", "AT+QX_NFC_CAL=0", {}, chip("SN100"), "\"0\"", "ATOK", {}},
     Case{"Calibrate", "AT+QX_NFC_CAL=1", {}, nullptr, "\"1\"", "ATOK", {}, {"nfc_cali 1 -> ok"}},
     Case{"CalibrateRefusedStillAtok", "AT+QX_NFC_CAL=1", {}, refuse, "\"0\"", "ATOK", {}},
-    Case{"CalValue", "AT+QX_NFC_CAL=2", {}, [](const Sandbox &b) { b.reply("nfc_get_cali_val 1", "37"); }, "\"1,37\"",
-         "ATOK", {}, {"nfc_get_cali_val 1 -> 37"}},
-    Case{"CalValueNull", "AT+QX_NFC_CAL=2", {}, [](const Sandbox &b) { b.reply("nfc_get_cali_val 1", "null"); },
-         "\"0,null\"", "ATNG", {}},
+    Case{"CalValue", "AT+QX_NFC_CAL=2", {}, rep("nfc_get_cali_val 1", "37"), "\"1,37\"", "ATOK", {},
+         {"nfc_get_cali_val 1 -> 37"}},
+    Case{"CalValueNull", "AT+QX_NFC_CAL=2", {}, rep("nfc_get_cali_val 1", "null"), "\"0,null\"", "ATNG", {}},
     Case{"CalValueError", "AT+QX_NFC_CAL=2", {}, refuse, "\"IKaelNfcAdapter error\"", "ATNG", {}},
-    Case{"CalValueSilent", "AT+QX_NFC_CAL=2", {}, silent_app, "\"IKaelNfcAdapter error\"", "ATNG", {}},
+    Case{"CalValueSilent", "AT+QX_NFC_CAL=2", {}, silent, "\"IKaelNfcAdapter error\"", "ATNG", {}},
     Case{"UnknownSet", "AT+QXNFC=4", {}, nullptr, "", "ATERROR", {}, {}},
-    Case{"UnknownCal", "AT+QX_NFC_CAL=3", {}, nullptr, "", "ATERROR", {}, {}},
-    Case{"UnknownIc", "AT+QX_NFC_IC=0", {}, nullptr, "", "ERROR", {}, {}},
-    Case{"UnknownChk", "AT+QX_NFC_CHK=?", {}, nullptr, "", "ERROR", {}, {}}), case_name);
+    Case{"UnknownIc", "AT+QX_NFC_IC=0", {}, nullptr, "", "ERROR", {}, {}}), case_name);
 
 // Reading a tag: the controller cycle, the start-up the project asks for, the activation.
 INSTANTIATE_TEST_SUITE_P(TagRead, NfcLine, ::testing::Values(
-    Case{"FourByteId", "AT+QXNFC=2", {"tag=0A1B2C3D"}, nullptr, quoted("0a1b2c3d"), "OK", cycle(cat({kV10, kTagRead})),
-         {"nfc_test c -> ok"}},
-    Case{"SevenByteId", "AT+QXNFC=2", {"tag=04:A1:B2:C3:D4:E5:80"}, nullptr, quoted("04a1b2c3d4e580"), "OK",
-         cycle(cat({kV10, kTagRead}))},
-    Case{"TenByteId", "AT+QXNFC=2", {"tag=00112233445566778899"}, nullptr, quoted("00112233445566778899"), "OK",
-         cycle(cat({kV10, kTagRead}))},
-    Case{"NotificationFirstReadsAgain", "AT+QXNFC=2", {"before=61 07 01 01"}, nullptr, quoted("0a1b2c3d"), "OK",
-         cycle(cat({kV10, kTagRead}))},
-    // Payload of 12 bytes that names a 4-byte ID: too short to hold it.
-    Case{"ShortActivation", "AT+QXNFC=2", {"activation=61 05 0C 01 02 04 00 FF 01 09 44 00 04 0A 1B"}, nullptr, quoted(""),
-         "ERROR", cycle(cat({kV10, kTagRead}))},
+    Case{"FourByteId", "AT+QXNFC=2", {"tag=0A1B2C3D"}, nullptr, kId, "OK", kRead10, {"nfc_test c -> ok"}},
+    Case{"TenByteId", "AT+QXNFC=2", {"tag=00112233445566778899"}, nullptr, quoted("00112233445566778899"), "OK", kRead10},
+    Case{"NotificationFirstReadsAgain", "AT+QXNFC=2", {"before=61 07 01 01"}, nullptr, kId, "OK", kRead10},
+    // 12 payload bytes naming a 4-byte ID, then an ID longer than the payload.
+    Case{"ShortActivation", "AT+QXNFC=2", {"activation=61 05 0C 01 02 04 00 FF 01 09 44 00 04 0A 1B"}, nullptr,
+         quoted(""), "ERROR", kRead10},
     Case{"IdLongerThanPayload", "AT+QXNFC=2", {"activation=61 05 0D 01 02 04 00 FF 01 09 44 00 0D 0A 1B 2C"}, nullptr,
-         quoted(""), "ERROR", cycle(cat({kV10, kTagRead}))},
+         quoted(""), "ERROR", kRead10},
     // An ID length of 0 makes the phone read once more, and nothing else comes.
     Case{"NoIdReadsAgain", "AT+QXNFC=2", {"activation=61 05 0D 01 02 04 00 FF 01 09 44 00 00 0A 1B 2C"}, nullptr,
-         quoted("timeout 2s"), "ERROR", cycle(cat({kV10, kTagRead}))},
-    Case{"Nci20ByProject", "AT+QXNFC=2", {"nci=2.0"}, project_61, quoted("0a1b2c3d"), "OK", cycle(cat({kV20, kTagRead}))},
-    Case{"Nci20ByOtherProject", "AT+QXNFC=2", {"nci=2.0"}, project_rt, quoted("0a1b2c3d"), "OK",
-         cycle(cat({kV20, kTagRead}))},
-    Case{"Nci20ByChip", "AT+QXNFC=2", {"nci=2.0"}, chip_sn100, quoted("0a1b2c3d"), "OK", cycle(cat({kV20, kTagRead}))},
-    Case{"LongerChipNameIsNci10", "AT+QXNFC=2", {}, chip_sn1000, quoted("0a1b2c3d"), "OK", cycle(cat({kV10, kTagRead}))},
+         quoted("timeout 2s"), "ERROR", kRead10},
+    Case{"Nci20ByProject", "AT+QXNFC=2", {"nci=2.0"}, project("RX6101"), kId, "OK", kRead20},
+    Case{"Nci20ByChip", "AT+QXNFC=2", {"nci=2.0"}, chip("SN100"), kId, "OK", kRead20},
+    Case{"LongerChipNameIsNci10", "AT+QXNFC=2", {}, chip("SN1000"), kId, "OK", kRead10},
     // One 51 00 00 per frame: the activation never comes.
-    Case{"Header51", "AT+QXNFC=2", {"mode=51"}, nullptr, quoted("timeout 2s"), "ERROR", cycle(cat({kV10, kTagRead}))},
+    Case{"Header51", "AT+QXNFC=2", {"mode=51"}, nullptr, quoted("timeout 2s"), "ERROR", kRead10},
     Case{"Absent", "AT+QXNFC=2", {}, absent, quoted("open nfc error"), "ERROR", {}},
-    Case{"NfcOnIsReleasedFirst", "AT+QXNFC=2", {}, nfc_on, quoted("0a1b2c3d"), "OK", cycle(cat({kV10, kTagRead})),
+    Case{"NfcOnIsReleasedFirst", "AT+QXNFC=2", {}, nfc_on, kId, "OK", kRead10,
          {"nfc_test c -> 1", "nfc_test 0 -> ok", "nfc_test c -> 1", "nfc_test c -> 0"}},
     Case{"NfcOnNotReleased", "AT+QXNFC=2", {}, nfc_on_refuses, "close nfc fail", "ERROR", {},
          {"nfc_test c -> 1", "nfc_test 0 -> error"}},
     Case{"AtModeStillAsksTheState", "AT+QXNFC=2", {}, [](const Sandbox &b) { b.reply("nfc_test c", "1"); is_sp = 1; },
-         quoted("0a1b2c3d"), "OK", cycle(cat({kV10, kTagRead})), {"nfc_test c -> 1"}}), case_name);
+         kId, "OK", kRead10, {"nfc_test c -> 1"}}), case_name);
 
 INSTANTIATE_TEST_SUITE_P(Controller, NfcLine, ::testing::Values(
-    Case{"IcCheck", "AT+QX_NFC_IC=1", {}, nullptr, "", "ATOK", cycle({kReset}), {"nfc_test 0 -> ok", "nfc_test c -> ok"}},
-    Case{"IcCheckAtModeAsksNothing", "AT+QX_NFC_IC=1", {}, [](const Sandbox &) { is_sp = 1; }, "", "ATOK", cycle({kReset}),
-         {}},
-    Case{"IcCheckNci20StillResetOnly", "AT+QX_NFC_IC=1", {"nci=2.0"}, project_61, "", "ATOK", cycle({kReset})},
-    Case{"IcHeader51", "AT+QX_NFC_IC=1", {"mode=51"}, nullptr, "", "ATNG", cycle({kReset})},
-    Case{"IcNotificationIsNoResponse", "AT+QX_NFC_IC=1", {"mode=61"}, nullptr, "", "ATOK", cycle({kReset})},
+    Case{"IcCheck", "AT+QX_NFC_IC=1", {}, nullptr, "", "ATOK", kIc, {"nfc_test 0 -> ok", "nfc_test c -> ok"}},
+    Case{"IcCheckAtModeAsksNothing", "AT+QX_NFC_IC=1", {}, at_mode, "", "ATOK", kIc, {}},
+    Case{"IcHeader51", "AT+QX_NFC_IC=1", {"mode=51"}, nullptr, "", "ATNG", kIc},
+    Case{"IcNotificationIsNoResponse", "AT+QX_NFC_IC=1", {"mode=61"}, nullptr, "", "ATOK", kIc},
     Case{"IcAbsent", "AT+QX_NFC_IC=1", {}, absent, "", "ATNG", {}},
     Case{"IcNotReleased", "AT+QX_NFC_IC=1", {}, refuse, "close nfc fail", "ATNG", {}, {"nfc_test 0 -> error"}},
-    Case{"SelfCheck", "AT+QX_NFC_CHK=0", {}, nullptr, "\"UICC:1;\"", "ATOK", cycle(cat({kV10, kSelfTest}))},
-    Case{"SelfCheckNci20", "AT+QX_NFC_CHK=0", {"nci=2.0"}, chip_sn100, "\"UICC:1;\"", "ATOK", cycle(cat({kV20, kSelfTest}))},
-    Case{"SwpLinkDead", "AT+QX_NFC_CHK=0", {"swp=3"}, nullptr, "\"UICC:0;\"", "ATNG", cycle(cat({kV10, kSelfTest}))},
-    Case{"SwpUnknownStatus", "AT+QX_NFC_CHK=0", {"swp=1"}, nullptr, "\"UICC:0;\"", "ATNG", cycle(cat({kV10, kSelfTest}))},
-    Case{"SwpRefused", "AT+QX_NFC_CHK=0", {"swp=refused"}, nullptr, "\"UICC:0;\"", "ATNG", cycle(cat({kV10, kSelfTest}))},
-    Case{"SwpHeader51", "AT+QX_NFC_CHK=0", {"mode=51"}, nullptr, "\"UICC:0;\"", "ATNG", cycle(cat({kV10, kSelfTest}))},
+    Case{"SelfCheck", "AT+QX_NFC_CHK=0", {}, nullptr, "\"UICC:1;\"", "ATOK", kChk10},
+    Case{"SelfCheckNci20", "AT+QX_NFC_CHK=0", {"nci=2.0"}, chip("SN100"), "\"UICC:1;\"", "ATOK", kChk20},
+    Case{"SwpLinkDead", "AT+QX_NFC_CHK=0", {"swp=3"}, nullptr, "\"UICC:0;\"", "ATNG", kChk10},
+    Case{"SwpUnknownStatus", "AT+QX_NFC_CHK=0", {"swp=1"}, nullptr, "\"UICC:0;\"", "ATNG", kChk10},
+    Case{"SwpRefused", "AT+QX_NFC_CHK=0", {"swp=refused"}, nullptr, "\"UICC:0;\"", "ATNG", kChk10},
     Case{"SelfCheckAbsent", "AT+QX_NFC_CHK=0", {}, absent, "\"UICC:0;\"", "ATNG", {}},
-    Case{"SelfCheckNotReleased", "AT+QX_NFC_CHK=0", {}, silent_app, "close nfc fail", "ATNG", {}},
-    Case{"CardEmulation", "AT+QX_NFC_CARD=0", {"tag=none"}, nullptr, "", "OK", cycle(cat({kV10, kCard})),
-         {"nfc_test c -> ok"}},
-    Case{"CardFieldNotificationFirst", "AT+QX_NFC_CARD=0", {"before=61070101,61070101"}, nullptr, "", "OK",
-         cycle(cat({kV10, kCard}))},
-    Case{"CardAlwaysNci10", "AT+QX_NFC_CARD=0", {}, project_61, "", "OK", cycle(cat({kV10, kCard}))},
+    Case{"SelfCheckNotReleased", "AT+QX_NFC_CHK=0", {}, silent, "close nfc fail", "ATNG", {}},
+    Case{"CardEmulation", "AT+QX_NFC_CARD=0", {"tag=none"}, nullptr, "", "OK", kCard10, {"nfc_test c -> ok"}},
+    Case{"CardFieldNotificationFirst", "AT+QX_NFC_CARD=0", {"before=61070101,61070101"}, nullptr, "", "OK", kCard10},
+    Case{"CardAlwaysNci10", "AT+QX_NFC_CARD=0", {}, project("RX6101"), "", "OK", kCard10},
     Case{"CardAbsent", "AT+QX_NFC_CARD=0", {}, absent, quoted("open nfc error"), "ERROR", {}},
-    Case{"CardNfcOnNotReleased", "AT+QX_NFC_CARD=0", {}, nfc_on_refuses, "close nfc fail", "ERROR", {}}),
-    case_name);
+    Case{"CardNfcOnNotReleased", "AT+QX_NFC_CARD=0", {}, nfc_on_refuses, "close nfc fail", "ERROR", {}}), case_name);
 
 TEST_F(Nfc, ControllerAnswersAsScripted) {
     nfc_script(box, {"nci=2.0", "firmware=12 02 03 04", "tag=0A1B2C3D"});
-    chip_sn100(box);
-    const std::string want = frame("AT+QXNFC=2", quoted("0a1b2c3d"), "OK");
-    EXPECT_EQ(serve("AT+QXNFC=2", SRC_TCP, want.size()), want);
+    chip("SN100")(box);
+    expect_frame("AT+QXNFC=2", kId, "OK");
     EXPECT_EQ(record(true), cycle({kReset, "out 40 00 01 00", "out 60 00 09 02 00 20 04 04 12 02 03 04", kInit20,
                                    "out 40 01 12 00 1A 1E 03 00 01 00 02 FF FF 01 00 01 02 01 00 02 00", kActivate,
                                    "out 4F 02 01 00", kPollMode, "out 40 02 02 00 00", kDiscover, "out 41 03 01 00",
                                    "out 61 05 14 01 02 04 00 FF 01 09 44 00 04 0A 1B 2C 3D 01 20 00 00 00 00"}));
 }
 
-// No tag: the worker is ended 2 s after the start-up began, and the controller closed.
-TEST_F(Nfc, NoTagTimesOutAfterTwoSeconds) {
-    nfc_script(box, {"tag=none"});
-    const std::string want = frame("AT+QXNFC=2", quoted("timeout 2s"), "ERROR");
-    const auto t0 = std::chrono::steady_clock::now();
-    EXPECT_EQ(serve("AT+QXNFC=2", SRC_TCP, want.size()), want);
-    const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() - t0).count();
-    EXPECT_EQ(record(), cycle(cat({kV10, kTagRead})));
-    const long long window = at("power 0", 2) - at("power 1");
-    EXPECT_GE(window, 1950) << box.events();
-    EXPECT_LT(window, 2600) << box.events();
-    EXPECT_GE(took, 1950);
-    // The dispatcher is free again and the next read works.
-    nfc_script(box, {"tag=0a1b2c3d"});
-    const std::string again = frame("AT+QXNFC=2", quoted("0a1b2c3d"), "OK");
-    EXPECT_EQ(serve("AT+QXNFC=2", SRC_TCP, again.size()), again);
-}
+TEST_F(Nfc, NoTagTimesOutAfterTwoSeconds) { times_out("AT+QXNFC=2", {"tag=none"}, kRead10, {"tag=0a1b2c3d"}, kId); }
 
-// No reader: the answer comes at 2 s; the worker left behind ends on its own without
-// writing to the controller again, and only then is the device really closed.
+// The card worker left behind ends without writing to the controller again.
 TEST_F(Nfc, CardEmulationWithoutReaderTimesOut) {
-    nfc_script(box, {"tag=none", "reader=0"});
-    const std::string want = frame("AT+QX_NFC_CARD=0", quoted("timeout 2s"), "ERROR");
-    EXPECT_EQ(serve("AT+QX_NFC_CARD=0", SRC_TCP, want.size()), want);
-    ASSERT_TRUE(all_closed());
-    EXPECT_EQ(record(), cycle(cat({kV10, kCard})));
-    const long long window = at("power 0", 2) - at("power 1");
-    EXPECT_GE(window, 1950);
-    EXPECT_LT(window, 2600);
-    // The next command opens the controller afresh.
-    nfc_script(box, {"reader=1"});
-    EXPECT_EQ(serve("AT+QX_NFC_CARD=0"), frame("AT+QX_NFC_CARD=0", "", "OK"));
+    times_out("AT+QX_NFC_CARD=0", {"tag=none", "reader=0"}, kCard10, {"reader=1"}, "");
 }
 
 // A controller that never answers holds the dispatcher for one bounded read, not for ever.
 TEST_F(Nfc, SilentControllerIsBounded) {
     nfc_script(box, {"mode=silent"});
     const auto t0 = std::chrono::steady_clock::now();
-    EXPECT_EQ(serve("AT+QX_NFC_IC=1"), frame("AT+QX_NFC_IC=1", "", "ATNG"));
-    EXPECT_EQ(serve("AT+QX_NFC_CHK=0"), frame("AT+QX_NFC_CHK=0", "\"UICC:0;\"", "ATNG"));
-    const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() - t0).count();
-    EXPECT_LT(took, 2 * (3000 + 200 + 600)) << "each command waits for one read and the release poll";
-    // The failed read closes the descriptor: nothing after it reaches the controller.
-    const Lines cut = {"open", "power 0", "power 1", kReset, "close"};
+    expect_frame("AT+QX_NFC_IC=1", "", "ATNG");
+    expect_frame("AT+QX_NFC_CHK=0", "\"UICC:0;\"", "ATNG");
+    EXPECT_LT(ms_since(t0), 2 * (3000 + 200 + 600)) << "each command waits for one read and the release poll";
+    const Lines cut = {"open", "power 0", "power 1", kReset, "close"};  // nothing reaches it after the failed read
     EXPECT_EQ(record(), cat({cut, cut}));
-    const std::string want = frame("AT+QXNFC=2", quoted("timeout 2s"), "ERROR");
-    EXPECT_EQ(serve("AT+QXNFC=2", SRC_TCP, want.size()), want);
+    expect_frame("AT+QXNFC=2", quoted("timeout 2s"), "ERROR");
 }
 
 // NFC that is on and never released: ten polls of the state, 200 ms apart.
 TEST_F(Nfc, ReleaseIsPolledTenTimes) {
     box.reply("nfc_test c", "1");
-    EXPECT_EQ(serve("AT+QX_NFC_IC=1", SRC_TCP, 64), frame("AT+QX_NFC_IC=1", "close nfc fail", "ATNG"));
+    expect_frame("AT+QX_NFC_IC=1", "close nfc fail", "ATNG");
     std::vector<long long> polls;
     for (const auto &e : box.event_list())
         if (e.kind == "message" && e.detail == "nfc_test c -> 1") polls.push_back(e.ms);
@@ -319,8 +283,7 @@ TEST_F(Nfc, TagArrivingFromTheStation) {
         for (int i = 0; i < 150 && at(kDiscover) < 0; ++i) std::this_thread::sleep_for(std::chrono::milliseconds(10));
         sim::station_send(box.root, "nfc tag 0a1b2c3d4e5f60");
     });
-    const std::string want = frame("AT+QXNFC=2", quoted("0a1b2c3d4e5f60"), "OK");
-    EXPECT_EQ(serve("AT+QXNFC=2", SRC_TCP, want.size()), want);
+    expect_frame("AT+QXNFC=2", quoted("0a1b2c3d4e5f60"), "OK");
     station.join();
 }
 
@@ -332,15 +295,16 @@ TEST(NfcDaemon, AnswersOverTcpAndRetriesWrites) {
     Daemon d(box);
     int s = d.connect_tcp();
     ASSERT_GE(s, 0);
-    auto exchange = [&](const std::string &line, const std::string &want, int ms = 5000) {
+    auto exchange = [&](const std::string &line, const std::string &body, const char *word) {
+        const std::string want = frame(line, body, word);
         send(s, line.data(), line.size(), MSG_NOSIGNAL);
-        EXPECT_EQ(read_some(s, want.size(), ms), want) << line;
+        EXPECT_EQ(read_some(s, want.size(), 5000), want) << line;
     };
-    exchange("AT+QXNFC=2", frame("AT+QXNFC=2", quoted("04a1b2c3d4e580"), "OK"));
-    exchange("AT+QX_NFC_CHK=0", frame("AT+QX_NFC_CHK=0", "\"UICC:1;\"", "ATOK"));
+    exchange("AT+QXNFC=2", quoted("04a1b2c3d4e580"), "OK");
+    exchange("AT+QX_NFC_CHK=0", "\"UICC:1;\"", "ATOK");
     nfc_script(box, {"mode=silent"});
-    exchange("AT+QX_NFC_CHK=0", frame("AT+QX_NFC_CHK=0", "\"UICC:0;\"", "ATNG"));
-    exchange("AT+QX_NFC_CAL=0", frame("AT+QX_NFC_CAL=0", "\"0\"", "ATOK"));
+    exchange("AT+QX_NFC_CHK=0", "\"UICC:0;\"", "ATNG");
+    exchange("AT+QX_NFC_CAL=0", "\"0\"", "ATOK");
     close(s);
     const std::string log = d.log();
     size_t errors = 0;

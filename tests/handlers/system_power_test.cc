@@ -3,6 +3,7 @@
 #include <chrono>
 #include <cstring>
 #include <filesystem>
+#include <functional>
 #include <thread>
 
 #include "tests/support/checks.h"
@@ -29,10 +30,11 @@ bool close_clears(size_t i) {
     return false;
 }
 
-using Setup = void (*)(const Sandbox &);
-void nv_read(const Sandbox &b) { b.fault("nv-read"); }
-void nv_write(const Sandbox &b) { b.fault("nv-write"); }
-void no_cert(const Sandbox &b) { b.fault("clear-certificate"); }
+using Setup = std::function<void(const Sandbox &)>;
+Setup fault(const char *name) { return [=](const Sandbox &b) { b.fault(name); }; }
+Setup rep(const char *message, const char *reply) { return [=](const Sandbox &b) { b.reply(message, reply); }; }
+Setup usb(const char *config) { return [=](const Sandbox &b) { b.set_prop(kUsb, config); }; }
+const Setup nv_read = fault("nv-read"), nv_write = fault("nv-write"), no_cert = fault("clear-certificate");
 void no_data(const Sandbox &b) { std::filesystem::remove_all(b.path("/data/vendor/engineermode")); }
 void rt_flag(const Sandbox &b) { b.write("/.sim/nv.bin", nv_pattern().replace(8, 4, "\x2e\xfb\xff\xff", 4)); }
 
@@ -56,7 +58,7 @@ protected:
         box.write("/.sim/nv.bin", nv_pattern());
         box.write("/.sim/services", "com.pyxa.engineermode.DpdtService\ncom.android.phone.fastSearchNet.FastSearchNetService\n");
     }
-    bool wait_event(const std::string &text, int ms = 8000) {  // workers sleep 1-2 s first
+    bool wait_event(const std::string &text, int ms = 8000) {  // bounded; workers sleep 1-2 s first
         for (int waited = 0; waited < ms; waited += 50) {
             if (box.events().find(text) != std::string::npos) return true;
             std::this_thread::sleep_for(std::chrono::milliseconds(50));
@@ -69,8 +71,8 @@ class PowerLine : public PowerTest, public ::testing::WithParamInterface<Case> {
 TEST_P(PowerLine, Answers) {
     const Case &c = GetParam();
     if (c.setup) c.setup(box);
-    const std::string frame = c.line + "\r\n" + c.body + "\r\n" + c.word + "\r\n";
-    EXPECT_EQ(serve(c.line, SRC_TCP, frame.size()), frame);
+    const std::string want = frame(c.line, c.body, c.word);
+    EXPECT_EQ(serve(c.line, SRC_TCP, want.size()), want);
     if (!c.events.empty()) {
         ASSERT_TRUE(wait_event(c.events.back())) << box.events();
     }
@@ -91,7 +93,7 @@ TEST_P(PowerLine, Answers) {
     if (c.absent) {
         EXPECT_EQ(log.find(c.absent), std::string::npos) << log;
     }
-    std::vector<std::string> seq;
+    std::vector<std::string> seq;  // a whole close, in order, then the case's own effects
     if (done)
         seq = {kFastStop, kExit, "setprop sys.dpdt.floating=0", "nv write", "certificate clear", "sync ",
                "message restoreSystemSettings -> ", "shell /system/bin/sh -c \"rm -r /storage/sdcard0/ram_dump\"",
@@ -110,9 +112,9 @@ INSTANTIATE_TEST_SUITE_P(Power, PowerLine, ::testing::Values(
     Case{"AT+QXADB=0,3", nullptr, "", "OK", Nv::Closed, {"message shutdown delay -> ok", kCharging}},
     Case{"AT+QXACM=3", nullptr, "", "OK", Nv::Closed, {"message shutdown delay -> ok", kCharging}},
     Case{"AT+QXACM=4", nullptr, "", "ERROR", Nv::Closed, {}, "message shutdown"},
-    Case{"AT+QXADB=0,1", [](const Sandbox &b) { b.reply("shutdown immediately", "busy"); }, "", "ERROR", Nv::Closed},
-    Case{"AT+QXADB=0,3", [](const Sandbox &b) { b.reply("shutdown delay", "no"); }, "", "ERROR", Nv::Closed},
-    Case{"AT+QXADB=0,0", [](const Sandbox &b) { b.reply("restoreSystemSettings", "done ok"); }, "", "OK", Nv::Closed},
+    Case{"AT+QXADB=0,1", rep("shutdown immediately", "busy"), "", "ERROR", Nv::Closed},
+    Case{"AT+QXADB=0,3", rep("shutdown delay", "no"), "", "ERROR", Nv::Closed},
+    Case{"AT+QXADB=0,0", rep("restoreSystemSettings", "done ok"), "", "OK", Nv::Closed},
     Case{"AT+QX_SHD_TIME=1,36", nullptr, "", "ATOK", Nv::Closed,
          {kPn + "36", "service-start com.pyxa.engineermode/.PnService  --ei time 36", kExit, kFastStop, kCharging}, "ShutDown"},
     Case{"AT+QX_SHD_TIME=1,1200", nullptr, "", "ATOK", Nv::Closed, {kPn + "1200", kExit, kCharging}},
@@ -124,16 +126,15 @@ INSTANTIATE_TEST_SUITE_P(Power, PowerLine, ::testing::Values(
     Case{"AT+QXADB=0,3", nv_write, "", "ERROR", Nv::Same, {}, "message"},
     Case{"AT+QXACM=4", nv_read, "", "ERROR", Nv::Same},
     Case{"AT+QXADB=0,2", no_cert, "\"close_adb failed\"", "ERROR", Nv::Written, {"nv write", "certificate clear"}, "message"},
-    Case{"AT+QXADB=0,0", [](const Sandbox &b) { b.reply("restoreSystemSettings", "error"); }, "\"close_adb failed\"",
-         "ERROR", Nv::Written, {"message restoreSystemSettings -> error"}, "shell"},
-    Case{"AT+QXADB=0,0", [](const Sandbox &b) { b.fault("testapp-silent"); }, "\"close_adb failed\"", "ERROR", Nv::Written},
+    Case{"AT+QXADB=0,0", rep("restoreSystemSettings", "error"), "\"close_adb failed\"", "ERROR", Nv::Written,
+         {"message restoreSystemSettings -> error"}, "shell"},
+    Case{"AT+QXADB=0,0", fault("testapp-silent"), "\"close_adb failed\"", "ERROR", Nv::Written},
     Case{"AT+QXADB=0,0", no_data, "\"close_adb failed\"", "ERROR", Nv::Written, {"certificate clear"}, "message"},
     Case{"AT+QX_SHD_TIME=1,40", no_cert, "\"close debug port fail\"", "ATNG", Nv::Written, {}, "activity"},
     // Forms that do not close the port.
-    Case{"AT+QXADB=1", [](const Sandbox &b) { b.set_prop(kUsb, "mtp"); }, "", "OK", Nv::Any, {}, nullptr,
+    Case{"AT+QXADB=1", usb("mtp"), "", "OK", Nv::Any, {}, nullptr,
          {{kUsb, "diag,serial_cdev,serial_tty,rmnet_ipa,mass_storage,adb"}, {kZdrem, "1"}}},
-    Case{"AT+QXACM=1", [](const Sandbox &b) { b.set_prop(kUsb, "diag,adb"); }, "", "OK", Nv::Any, {}, "setprop sys.usb",
-         {{kZdrem, "1"}}},
+    Case{"AT+QXACM=1", usb("diag,adb"), "", "OK", Nv::Any, {}, "setprop sys.usb", {{kZdrem, "1"}}},
     Case{"AT+QXADB=1", nv_read, "\"get nv failed\"", "ERROR", Nv::Same, {}, kZdrem},
     Case{"AT+QXADB=1", nv_write, "", "ERROR", Nv::Same, {}, kZdrem},
     Case{"AT+QXACM=2", nv_read, "\"get NV failed\"", "ERROR", Nv::Same},
@@ -159,20 +160,22 @@ INSTANTIATE_TEST_SUITE_P(Power, PowerLine, ::testing::Values(
     Case{"AT+QX_SHD_TIME=1,4294967332", nullptr, "", "ATNG", Nv::Same, {}, "activity"},
     Case{"AT+QX_SHD_TIME=1,18446744073709551652", nullptr, "", "ATNG", Nv::Same, {}, "service"}), by_line);
 
+// A close does not create a charge node the phone lacks, and AT+QXACM=4 never charges.
 TEST_F(PowerTest, Acm4NeverChargesAndAMissingChargeNodeStaysMissing) {
     std::filesystem::remove(box.path(kSoc));
-    EXPECT_EQ(serve("AT+QXACM=4"), "AT+QXACM=4\r\n\r\nERROR\r\n");
+    EXPECT_EQ(serve("AT+QXACM=4"), frame("AT+QXACM=4", "", "ERROR"));
     EXPECT_FALSE(box.exists(kSoc));
     EXPECT_EQ(box.prop("persist.sys.factory.mode"), "no");
     EXPECT_FALSE(wait_event(kCharging, 1500));
 }
 
+// The debug-port field written by an open and a close reads back through both query forms.
 TEST_F(PowerTest, AdbFlagReadsBackAfterOpenAndClose) {
-    EXPECT_EQ(serve("AT+QXADB=1"), "AT+QXADB=1\r\n\r\nOK\r\n");
+    EXPECT_EQ(serve("AT+QXADB=1"), frame("AT+QXADB=1", "", "OK"));
     EXPECT_EQ(box.read("/.sim/nv.bin").substr(12, 4), std::string("\1\0\0\0", 4));
-    EXPECT_EQ(serve("AT+QXADB=2"), "AT+QXADB=2\r\n\r\n\"1\"\r\n\r\nOK\r\n");
-    EXPECT_EQ(serve("AT+QXADB=0,0"), "AT+QXADB=0,0\r\n\r\nOK\r\n");
-    EXPECT_EQ(serve("AT+QXACM=2"), "AT+QXACM=2\r\n\r\n\"0\"\r\n\r\nOK\r\n");
+    EXPECT_EQ(serve("AT+QXADB=2"), frame("AT+QXADB=2", "\r\n\"1\"\r\n", "OK"));
+    EXPECT_EQ(serve("AT+QXADB=0,0"), frame("AT+QXADB=0,0", "", "OK"));
+    EXPECT_EQ(serve("AT+QXACM=2"), frame("AT+QXACM=2", "\r\n\"0\"\r\n", "OK"));
 }
 
 }  // namespace
