@@ -270,7 +270,6 @@ INSTANTIATE_TEST_SUITE_P(Amplifier, AudioLine, ::testing::Values(
     Case{"AppRefuses", 0, "AT+ZNGF=0", refuse, "\"start audio fail\"", "ERROR", {}, 0},
     Case{"CalibrationFails", 0, "AT+ZNGF=0", [](const Sandbox &b) { script(b, "smartpa_calibrate", "6"); }, "", "ERROR",
          {kMaker0, "smartpa_calibrate() -> 6"}, 0, {"message speakerld 2 -> ok", "smartpa_calibrate() -> 6", "message speakerld 0 -> ok"}},
-    Case{"NoAmplifier", 0, "AT+ZNGF=0", smartpa_fault, "", "ERROR", {"get_smartpa_manufacturer() -> -1", "smartpa_calibrate() -> -1"}, 0},
     Case{"", 0, "AT+ZNGF=apk", nullptr, "R0=7.21ohm F0=812Hz", "OK", {kMaker0, kCalOk}, 0},
     Case{"NoAmplifier", 0, "AT+ZNGF=apk", smartpa_fault, "smartpa not found", "ERROR",
          {"get_smartpa_manufacturer() -> -1", "smartpa_calibrate() -> -1"}, 0},
