@@ -1,21 +1,18 @@
 // ADC, voltage and temperature sampling: one-shot readings, the PMIC register read, the
 // streamed EADC and BATADC lines (their figures, periods, stop forms and what they leave
 // behind), the VBUS sampling worker and its stored result, and the thermal-zone filter.
-#include <sys/socket.h>
-
 #include <chrono>
 #include <cstring>
 #include <filesystem>
-#include <string>
 #include <thread>
-#include <utility>
-#include <vector>
 
 #include "core/nv.h"
 #include "handlers/adc.h"
 #include "platform/sim/power_models.h"
 #include "platform/sim/sim.h"
+#include "tests/support/checks.h"
 #include "tests/support/in_process.h"
+#include "tests/support/test_name.h"
 
 namespace {
 
@@ -32,25 +29,11 @@ const std::string kTestInfo = "/cache/recovery/last_test_info";
 const std::string kOnline = "/sys/class/power_supply/usb/online";
 const std::string kRegmap = "/d/regmap/spmi0-00/";
 
-std::string nv_pattern(int eadc_word = 0x2a2b2c2d) {
-    std::string nv(PYXA_NV_SIZE, '\0');
-    for (size_t i = 0; i < nv.size(); ++i) nv[i] = static_cast<char>(0x31 + i % 173);
+std::string nv_pattern() {  // every byte non-zero, with a known EADC word
+    std::string nv = nv_fill(0x31, 173);
+    const int eadc_word = 0x2a2b2c2d;
     memcpy(nv.data() + nv::kEadcWord, &eadc_word, 4);
     return nv;
-}
-
-std::string case_name(const std::string &line, const std::string &tag) {
-    std::string name;
-    bool upper = true;
-    for (char c : line.substr(line.rfind('+') + 1)) {
-        if (isalnum(static_cast<unsigned char>(c))) {
-            name += upper ? static_cast<char>(toupper(c)) : static_cast<char>(tolower(c));
-            upper = false;
-        } else {
-            name += '_';
-        }
-    }
-    return tag.empty() ? name : name + "_" + tag;
 }
 
 using Files = std::vector<std::pair<std::string, std::string>>;
@@ -101,10 +84,20 @@ protected:
     static long ms_between(Clock::time_point a, Clock::time_point b) {
         return std::chrono::duration_cast<std::chrono::milliseconds>(b - a).count();
     }
+    // The answer to line is body and word, read without waiting past it.
+    void expect(const std::string &line, const std::string &body, const std::string &word) {
+        const std::string want = frame(line, body, word);
+        EXPECT_EQ(serve(line, SRC_TCP, want.size()), want);
+    }
+    // min and max of the big cores, then max and min of the little ones.
+    std::string cores() const {
+        return box.read(kCpu4 + "min_cpus") + "," + box.read(kCpu4 + "max_cpus") + "," + box.read(kCpu0 + "max_cpus") + "," +
+               box.read(kCpu0 + "min_cpus");
+    }
 };
 
 struct Case {
-    std::string line, tag;
+    std::string line, tag = "";
     Files given = {};  // device files written before the line ("" value: removed)
     const char *fault = nullptr;
     std::string project = "";
@@ -125,8 +118,7 @@ TEST_P(AdcLine, Answers) {
     }
     if (c.fault) box.fault(c.fault);
     if (!c.project.empty()) box.write("/.sim/config", "project=" + c.project + "\n");
-    const std::string frame = c.line + "\r\n" + c.body + "\r\n" + c.word + "\r\n";
-    EXPECT_EQ(serve(c.line, SRC_TCP, frame.size()), frame);
+    expect(c.line, c.body, c.word);
     EXPECT_EQ(answer(1, 0), "");
     EXPECT_EQ(sampling_workers_alive(), 0);
     for (const auto &[path, text] : c.after) EXPECT_EQ(box.read(path), text) << path;
@@ -134,7 +126,9 @@ TEST_P(AdcLine, Answers) {
     EXPECT_EQ(box.read("/.sim/nv.bin"), nv_pattern());
 }
 
-std::string name_of(const ::testing::TestParamInfo<Case> &info) { return case_name(info.param.line, info.param.tag); }
+std::string name_of(const ::testing::TestParamInfo<Case> &info) {
+    return test_name(info.param.line) + (info.param.tag.empty() ? "" : "_" + info.param.tag);
+}
 
 const std::string kAcAvg = "/sys/class/power_supply/cms/current_ac_avg_now";
 const std::string kLastCurrent = "/cache/recovery/last_ChargeCurrent";
@@ -143,18 +137,18 @@ const std::string kNotSupported = "\r\n\"current not supported_adapter: ";
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(OneShot, AdcLine, ::testing::Values(
     Case{.line = "AT+EADC=0", .tag = "NotRunning", .word = "OK"},
-    Case{.line = "AT+EADC=2", .tag = "", .body = "\"1.48\"", .word = "OK"},
+    Case{.line = "AT+EADC=2", .body = "\"1.48\"", .word = "OK"},
     Case{.line = "AT+EADC=2", .tag = "Negative", .given = {{kAcAvg, "-1235\n"}}, .body = "\"-1.24\"", .word = "OK"},
     Case{.line = "AT+EADC=2", .tag = "NoNode", .given = {{kAcAvg, ""}}, .word = "ERROR"},
-    Case{.line = "AT+EADC=3", .tag = "", .given = {{kLastCurrent, "1500mA\n"}}, .body = "\r\n\"1500mA\n\"\r\n", .word = "OK"},
+    Case{.line = "AT+EADC=3", .given = {{kLastCurrent, "1500mA\n"}}, .body = "\r\n\"1500mA\n\"\r\n", .word = "OK"},
     Case{.line = "AT+EADC=3", .tag = "Cut", .given = {{kLastCurrent, std::string(40, '7')}},
          .body = "\r\n\"" + std::string(30, '7') + "\"\r\n", .word = "OK"},
     Case{.line = "AT+EADC=3", .tag = "OneCharacter", .given = {{kLastCurrent, "7"}}, .body = "\"not Test!\"", .word = "ERROR"},
     Case{.line = "AT+EADC=3", .tag = "NotTested", .body = "\"not Test!\"", .word = "ERROR"},
-    Case{.line = "AT+EADC=4", .tag = "", .word = "OK"},
-    Case{.line = "AT+EADC=6", .tag = "", .body = "\r\n\"707472429\"\r\n", .word = "OK"},
+    Case{.line = "AT+EADC=4", .word = "OK"},
+    Case{.line = "AT+EADC=6", .body = "\r\n\"707472429\"\r\n", .word = "OK"},
     Case{.line = "AT+EADC=6", .tag = "NvReadFails", .fault = "nv-read", .word = "ERROR"},
-    Case{.line = "AT+EADC=7", .tag = "", .word = "ERROR"},
+    Case{.line = "AT+EADC=7", .word = "ERROR"},
     Case{.line = "AT+BATADC=1", .tag = "NoFastAdapter", .given = {{kAdapter, "0\n"}}, .body = kNotSupported + "0\"\r\n",
          .word = "ERROR"},
     Case{.line = "AT+BATADC=0", .tag = "NoFastAdapter", .given = {{kAdapter, "3\n"}}, .body = kNotSupported + "-22\"\r\n",
@@ -163,8 +157,8 @@ INSTANTIATE_TEST_SUITE_P(OneShot, AdcLine, ::testing::Values(
          .word = "ERROR"},
     Case{.line = "AT+BATADC=0", .tag = "OldProject", .given = {{kAdapter, "0\n"}}, .project = "RX2101", .word = "OK"},
     Case{.line = "AT+BATADC=0", .tag = "Adapter2", .given = {{kAdapter, "2"}}, .word = "OK"},
-    Case{.line = "AT+BATADC=2", .tag = "", .word = "ERROR"},
-    Case{.line = "AT+QX_ADC_REG=1", .tag = "", .body = "\r\n\"305e: 80\n\"\r\n", .word = "ATOK",
+    Case{.line = "AT+BATADC=2", .word = "ERROR"},
+    Case{.line = "AT+QX_ADC_REG=1", .body = "\r\n\"305e: 80\n\"\r\n", .word = "ATOK",
          .after = {{kRegmap + "count", "1"}, {kRegmap + "address", "0x305e"}}},
     Case{.line = "AT+QX_ADC_REG=1", .tag = "NoCount", .given = {{kRegmap + "count", ""}},
          .body = "\"write /d/regmap/spmi0-00/count error:No such file or directory\"", .word = "ATNG"},
@@ -172,20 +166,20 @@ INSTANTIATE_TEST_SUITE_P(OneShot, AdcLine, ::testing::Values(
          .word = "ATNG"},
     Case{.line = "AT+QX_ADC_REG=1", .tag = "TableEdited", .given = {{"/.sim/pmic_registers", "0x305e=0x3c\n"}},
          .body = "\r\n\"305e: 3c\n\"\r\n", .word = "ATOK"},
-    Case{.line = "AT+QX_ADC_REG=0", .tag = "", .word = "ATERROR", .after = {{kRegmap + "address", "0x305e\n"}}}),
+    Case{.line = "AT+QX_ADC_REG=0", .word = "ATERROR", .after = {{kRegmap + "address", "0x305e\n"}}}),
     name_of);
 
 INSTANTIATE_TEST_SUITE_P(VbusForms, AdcLine, ::testing::Values(
     Case{.line = "AT+QX_VBUS_VOLT=0,1,2", .tag = "TwoFields", .body = "\"parameter error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,1,x,3", .tag = "", .body = "\"digitValue error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,10001,0,1", .tag = "", .body = "\"range error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,0,0,0", .tag = "", .body = "\"range error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,0,0,101", .tag = "", .body = "\"range error\"", .word = "ATNG"},
+    Case{.line = "AT+QX_VBUS_VOLT=0,1,x,3", .body = "\"digitValue error\"", .word = "ATNG"},
+    Case{.line = "AT+QX_VBUS_VOLT=0,10001,0,1", .body = "\"range error\"", .word = "ATNG"},
+    Case{.line = "AT+QX_VBUS_VOLT=0,0,0,0", .body = "\"range error\"", .word = "ATNG"},
+    Case{.line = "AT+QX_VBUS_VOLT=0,0,0,101", .body = "\"range error\"", .word = "ATNG"},
     Case{.line = "AT+QX_VBUS_VOLT=0,0,0,99999999999999999999", .tag = "Absurd", .body = "\"range error\"", .word = "ATNG"},
     Case{.line = "AT+QX_VBUS_VOLT=1", .tag = "NeverRun", .body = "\"\"", .word = "ATNG"},
     Case{.line = "AT+QX_VBUS_VOLT=1", .tag = "Stored", .given = {{kTestInfo, "usb_voltage=5012,4990,5001\n"}},
          .body = "\"5012,4990,5001\"", .word = "ATOK"},
-    Case{.line = "AT+QX_VBUS_VOLT=2", .tag = "", .word = "ATERROR"}),
+    Case{.line = "AT+QX_VBUS_VOLT=2", .word = "ATERROR"}),
     name_of);
 // clang-format on
 
@@ -237,20 +231,14 @@ TEST_F(Eadc, StreamsEvery300msWithCoresLimitedAndRestoresOnStop) {
     // Lines can arrive late on a busy machine, never early: the fifth is 4 periods out.
     EXPECT_GE(ms_between(t0, seen[4]), 4 * 300 - 20);
     EXPECT_EQ(box.read(kSoc), "100");
-    EXPECT_EQ(box.read(kCpu4 + "min_cpus"), "0");
-    EXPECT_EQ(box.read(kCpu4 + "max_cpus"), "0");
-    EXPECT_EQ(box.read(kCpu0 + "max_cpus"), "1");
-    EXPECT_EQ(box.read(kCpu0 + "min_cpus"), "1");
+    EXPECT_EQ(cores(), "0,0,1,1");
     EXPECT_EQ(sampling_workers_alive(), 1);
 
     send("AT+EADC=0");
     EXPECT_NE(until("AT+EADC=0\r\n\r\nOK\r\n").find("AT+EADC=0\r\n\r\nOK\r\n"), std::string::npos);
     ASSERT_TRUE(wait_workers_gone(3000));
     EXPECT_EQ(box.read(kSoc), "70");
-    EXPECT_EQ(box.read(kCpu4 + "min_cpus"), "2");
-    EXPECT_EQ(box.read(kCpu4 + "max_cpus"), "4");
-    EXPECT_EQ(box.read(kCpu0 + "max_cpus"), "4");
-    EXPECT_EQ(box.read(kCpu0 + "min_cpus"), "1");
+    EXPECT_EQ(cores(), "2,4,4,1");
     read_some(station, 4096, 100);           // a line the worker was writing as it stopped
     EXPECT_EQ(until("+EADC:", 1, 700), "");  // and nothing after it ended
 }
@@ -262,27 +250,19 @@ TEST_F(Eadc, AtModeLeavesCoresAndChargeLevelAlone) {
     send("AT+EADC=0");
     ASSERT_TRUE(wait_workers_gone(3000));
     EXPECT_EQ(box.read(kSoc), "0\n");  // not in factory mode
-    EXPECT_EQ(box.read(kCpu4 + "min_cpus"), "2\n");
-    EXPECT_EQ(box.read(kCpu4 + "max_cpus"), "4\n");
-    EXPECT_EQ(box.read(kCpu0 + "max_cpus"), "4\n");
-    EXPECT_EQ(box.read(kCpu0 + "min_cpus"), "1\n");
+    EXPECT_EQ(cores(), "2\n,4\n,4\n,1\n");  // never written
 }
 
-TEST_F(Eadc, SecondStartAnswersOkWithoutASecondWorker) {
+TEST_F(Eadc, SecondStartAddsNoWorkerButARestartWithinAPeriodDoes) {
     send("AT+EADC=1");
     until("+EADC:");
     send("AT+EADC=1");
     EXPECT_NE(until("AT+EADC=1\r\n\r\nOK\r\n").find("AT+EADC=1\r\n\r\nOK\r\n"), std::string::npos);
     EXPECT_EQ(sampling_workers_alive(), 1);
-}
-
-TEST_F(Eadc, StopAndStartWithinAPeriodLeavesTwoWorkersThatOneStopEnds) {
-    send("AT+EADC=1");
-    until("+EADC:");
     send("AT+EADC=0");
     send("AT+EADC=1");  // the first worker is asleep and never sees the flag cleared
     EXPECT_EQ(sampling_workers_alive(), 2);
-    send("AT+EADC=0");
+    send("AT+EADC=0");  // one stop ends both
     ASSERT_TRUE(wait_workers_gone(3000));
     EXPECT_EQ(box.read(kCpu4 + "max_cpus"), "4");
 }
@@ -296,29 +276,6 @@ TEST_F(Eadc, UnreadableNodeEndsTheStreamAndClearsTheFlag) {
     box.write(kBattery + "current_now", "-1000\n");
     send("AT+EADC=1");  // the flag was cleared, so this starts a new stream
     EXPECT_NE(until("+EADC:").find("+EADC: \"4.12,30.10,0.58,-1.00,4.50\"\r\n"), std::string::npos);
-}
-
-// On the real daemon in AT mode, over TCP: the answer, then lines 300 ms apart with the
-// low voltage raised, and silence once stopped; the cores are left alone.
-TEST(EadcDaemon, StreamsToTheTcpStationUntilStopped) {
-    Sandbox box;
-    box.write(kBattery + "voltage_now", "3600000\n");
-    Daemon d(box, "console-at=sendAT");
-    int s = d.connect_tcp();
-    ASSERT_GE(s, 0);
-    const std::string answer = "AT+EADC=1\r\n\r\nOK\r\n", line = "+EADC: \"3.83,30.10,0.58,-412.00,4.50\"\r\n";
-    const auto t0 = Clock::now();
-    send(s, "AT+EADC=1", 9, MSG_NOSIGNAL);  // a TCP station sends bare lines
-    std::string got = read_some(s, answer.size() + 4 * line.size(), 5000);
-    const long ms = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - t0).count();
-    EXPECT_EQ(got, answer + line + line + line + line);
-    EXPECT_GE(ms, 3 * 300 - 20);
-    send(s, "AT+EADC=0", 9, MSG_NOSIGNAL);
-    std::string after = read_some(s, 4096, 800);
-    EXPECT_NE(after.find("AT+EADC=0\r\n\r\nOK\r\n"), std::string::npos) << after;
-    EXPECT_EQ(read_some(s, 4096, 800), "");
-    EXPECT_EQ(box.read(kCpu4 + "max_cpus"), "4\n");
-    close(s);
 }
 
 // ---- BATADC stream
@@ -360,31 +317,26 @@ protected:
         sim::read_kv(box.path(kTestInfo), "usb_voltage", v);
         return v;
     }
-    // The answer to line is body and word, read without waiting past it.
-    void expect_answer(const std::string &line, const std::string &body, const std::string &word) {
-        const std::string frame = line + "\r\n" + body + "\r\n" + word + "\r\n";
-        EXPECT_EQ(serve(line, SRC_TCP, frame.size()), frame);
-    }
 };
 
 TEST_F(Vbus, CableOutSamplesAfterTheDelayAndStoresMaxMinAverage) {
     box.write(kOnline, "0\n");
     box.write("/sys/class/power_supply/usb/voltage_now", "5012999\n");
     const auto t0 = Clock::now();
-    expect_answer("AT+QX_VBUS_VOLT=0,300,50,3", "", "ATOK");
+    expect("AT+QX_VBUS_VOLT=0,300,50,3", "", "ATOK");
     EXPECT_EQ(stored(), "null");
-    expect_answer("AT+QX_VBUS_VOLT=0,0,0,1", "\"vbus_reading\"", "ATNG");
+    expect("AT+QX_VBUS_VOLT=0,0,0,1", "\"vbus_reading\"", "ATNG");
     ASSERT_TRUE(wait_workers_gone(5000));
     EXPECT_GE(ms_between(t0, Clock::now()), 300 + 3 * 50);
     EXPECT_EQ(stored(), "5012,5012,5012");
-    expect_answer("AT+QX_VBUS_VOLT=1", "\"5012,5012,5012\"", "ATOK");
+    expect("AT+QX_VBUS_VOLT=1", "\"5012,5012,5012\"", "ATOK");
     EXPECT_EQ(box.events(), "shell /system/bin/sh -c \"chmod 664 /sys/class/power_supply/usb/online\"\n");
 }
 
 TEST_F(Vbus, StopDuringTheRunStoresNothing) {
     box.write(kOnline, "0\n");
-    expect_answer("AT+QX_VBUS_VOLT=0,10,1500,5", "", "ATOK");
-    expect_answer("AT+QX_VBUS_VOLT=1", "\"null\"", "ATNG");
+    expect("AT+QX_VBUS_VOLT=0,10,1500,5", "", "ATOK");
+    expect("AT+QX_VBUS_VOLT=1", "\"null\"", "ATNG");
     ASSERT_TRUE(wait_workers_gone(5000));
     EXPECT_EQ(stored(), "null");
 }
@@ -402,10 +354,10 @@ TEST_P(VbusSeries, StoresMaxMinAverageInMillivolts) {
     box.write(kOnline, "0\n");
     box.sequence("/sys/class/power_supply/usb/voltage_now", c.microvolts);
     const std::string line = "AT+QX_VBUS_VOLT=0,0,10," + std::to_string(c.microvolts.size());
-    expect_answer(line, "", "ATOK");
+    expect(line, "", "ATOK");
     ASSERT_TRUE(wait_workers_gone(5000));
     EXPECT_EQ(stored(), c.stored);
-    expect_answer("AT+QX_VBUS_VOLT=1", "\"" + c.stored + "\"", "ATOK");
+    expect("AT+QX_VBUS_VOLT=1", "\"" + c.stored + "\"", "ATOK");
 }
 
 // clang-format off
@@ -420,7 +372,7 @@ INSTANTIATE_TEST_SUITE_P(Vbus, VbusSeries, ::testing::Values(
 TEST_F(Vbus, UnplugEndsTheStartWaitEarly) {
     box.sequence(kOnline, {"1", "1", "0"});
     const auto t0 = Clock::now();
-    expect_answer("AT+QX_VBUS_VOLT=0,5000,0,1", "", "ATOK");
+    expect("AT+QX_VBUS_VOLT=0,5000,0,1", "", "ATOK");
     ASSERT_TRUE(wait_workers_gone(8000));
     const long ms = ms_between(t0, Clock::now());
     EXPECT_GE(ms, 2000);  // two whole-second checks, the second seeing the cable out
@@ -448,11 +400,9 @@ TEST_P(NtcFilter, AppendsOrSkips) {
 
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(Zones, NtcFilter, ::testing::Values(
-    NtcCase{"Millidegrees", "", "31200", "MSM_THERM:%.1f,", true, "MSM_THERM:31.2,"},
     NtcCase{"Appends", "MSM_THERM:31.2,", "29800", "PA_THERM:%.1f,", true, "MSM_THERM:31.2,PA_THERM:29.8,"},
     NtcCase{"SinglePrecision", "", "20450", "SDM_THERM:%.1f,", true, "SDM_THERM:20.5,"},
     NtcCase{"RawMinus40Skipped", "X,", "-40", "MSM_THERM:%.1f,", false, "X,"},
-    NtcCase{"RawMinus40PointSkipped", "X,", "-40.0", "MSM_THERM:%.1f,", false, "X,"},
     NtcCase{"Minus40DegreesSkipped", "X,", "-40000", "WIFI_SKIN_THERM:%.1f,", false, "X,"},
     NtcCase{"JustAboveMinus40Kept", "", "-39999", "PA_THERM:%.1f,", true, "PA_THERM:-40.0,"},
     NtcCase{"CutAtFormatPlus3", "", "123456789", "MSM_THERM:%.1f,", true, "MSM_THERM:123456.8"},

@@ -1,10 +1,6 @@
 // Display, touch and backlight commands: exact frames, the NV record, properties, panel
 // nodes and the test-app messages and activities, on phones with one panel and with two.
-#include <sys/socket.h>
-#include <unistd.h>
-
 #include <chrono>
-#include <cstdint>
 #include <cstring>
 #include <filesystem>
 #include <thread>
@@ -13,8 +9,9 @@
 #include "core/nv.h"
 #include "platform/device.h"
 #include "platform/sim/sim.h"
-#include "tests/support/daemon.h"
+#include "tests/support/checks.h"
 #include "tests/support/in_process.h"
+#include "tests/support/test_name.h"
 
 namespace {
 
@@ -34,8 +31,7 @@ std::string msg(const std::string &text, const std::string &reply = "ok") { retu
 
 // Every byte non-zero, so a stray write shows; fields given are set over the pattern.
 std::string nv_record(const Fields &fields) {
-    std::string rec(PYXA_NV_SIZE, '\0');
-    for (size_t i = 0; i < rec.size(); ++i) rec[i] = static_cast<char>(0x11 + i % 199);
+    std::string rec = nv_fill(0x11, 199);
     for (auto [off, value] : fields) memcpy(rec.data() + off, &value, sizeof value);
     return rec;
 }
@@ -57,16 +53,12 @@ struct Case {
     std::string panel = "";   // what the panel model records, taken apart (it runs on its own thread)
     Fields nv_after = {};     // NV fields the line changes
     Pairs nodes = {};         // node texts after the line
-    Pairs props = {};
 };
 
 void PrintTo(const Case &c, std::ostream *os) { *os << c.line << (c.tag.empty() ? "" : " (" + c.tag + ")"); }
 
 std::string case_name(const ::testing::TestParamInfo<Case> &info) {
-    std::string name = info.param.line.substr(0, 32) + (info.param.tag.empty() ? "" : "_" + info.param.tag);
-    for (char &ch : name)
-        if (!isalnum(static_cast<unsigned char>(ch))) ch = '_';
-    return name;
+    return test_name(info.param.line) + (info.param.tag.empty() ? "" : "_" + info.param.tag);
 }
 
 class DisplayTest : public InProcess {
@@ -112,20 +104,18 @@ TEST_P(DisplayLine, Answers) {
     if (c.fault) box.fault(c.fault);
     for (const auto &[message, reply] : c.replies) box.reply(message, reply);
 
-    const std::string frame = c.line + "\r\n" + c.body + "\r\n" + c.word + "\r\n";
-    EXPECT_EQ(serve(c.line, SRC_TCP, frame.size()), frame);
+    const std::string want = frame(c.line, c.body, c.word);
+    EXPECT_EQ(serve(c.line, SRC_TCP, want.size()), want);
     EXPECT_EQ(answer(1, 0), "");
     EXPECT_EQ(without_panel(c.panel), c.events);
     Fields after = c.nv;
     after.insert(after.end(), c.nv_after.begin(), c.nv_after.end());
     EXPECT_EQ(box.read("/.sim/nv.bin"), nv_record(after));
     for (const auto &[path, text] : c.nodes) EXPECT_EQ(box.read(path), text) << path;
-    for (const auto &[name, value] : c.props) EXPECT_EQ(box.prop(name), value) << name;
 }
 
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(Colours, DisplayLine, ::testing::Values(
-    Case{.line = "AT+LCMT=1,W", .events = kLcm + "-e lcm_color W\n"},
     Case{.line = "AT+LCMT=1,R,G", .events = kLcm + "-e lcm_color R\n"},
     Case{.line = "AT+LCMT=1," + kLongArg + kLongArg, .tag = "Long", .events = kLcm + "-e lcm_color " + (kLongArg + kLongArg).substr(0, 86) + "\n"},
     Case{.line = "AT+LCMT=1", .word = "ERROR"},
@@ -135,10 +125,6 @@ INSTANTIATE_TEST_SUITE_P(Colours, DisplayLine, ::testing::Values(
          .nv = {{nv::kMainPanelColour, 0xD7D7D8}},
          .events = "setprop ro.sys.mainlcm.cali=14145496\n" + kLcm + "-e lcm_color W\n",
          .panel = "main calibrate 1490540504", .nodes = {{kMainCali, "0xD7 0xD7 0xD8\n"}}},
-    Case{.line = "AT+LCMT=1,W", .tag = "PanelTakesNothing", .back = true, .fault = "panel-calibration",
-         .files = {{kMainCali, kLost}}, .nv = {{nv::kMainPanelColour, 0xD7D7D8}},
-         .events = "setprop ro.sys.mainlcm.cali=14145496\n" + kLcm + "-e lcm_color W\n",
-         .panel = "main calibrate 1490540504 -> ignored", .nodes = {{kMainCali, kLost}}},
     Case{.line = "AT+LCMT=1,W", .tag = "HighestColourRestored", .back = true, .files = {{kMainCali, kLost}},
          .nv = {{nv::kMainPanelColour, 0xFFFFFE}},
          .events = "setprop ro.sys.mainlcm.cali=16777214\n" + kLcm + "-e lcm_color W\n",
@@ -167,8 +153,6 @@ INSTANTIATE_TEST_SUITE_P(Colours, DisplayLine, ::testing::Values(
     Case{.line = "AT+LCMT=2,0", .events = "setprop persist.sys.em.lcm_choose=0\n" + kFloating + kChoose + "-e exit 1\n"},
     Case{.line = "AT+LCMT_BACK=2,1", .back = true,
          .events = "setprop persist.sys.em.lcm_choose=1\n" + kFloating + kChoose + "-e enter 1 --ei display_id 4096\n"},
-    Case{.line = "AT+LCMT_BACK=2,0", .back = true,
-         .events = "setprop persist.sys.em.lcm_choose=0\n" + kFloating + kChoose + "-e exit 1 --ei display_id 4096\n"},
     Case{.line = "AT+LCMT=3", .word = "ERROR"},
     Case{.line = "AT+QX_LCM_IC=0", .word = "ATOK"},
     Case{.line = "AT+QX_LCM_IC=0", .tag = "WrongDriver", .files = {{"/sys/class/leds/lm3697-backlight/registers", "BRT: 1\n"}},
@@ -217,7 +201,6 @@ INSTANTIATE_TEST_SUITE_P(KeepAwake, DisplayLine, ::testing::Values(
 
 INSTANTIATE_TEST_SUITE_P(BacklightAndWake, DisplayLine, ::testing::Values(
     Case{.line = "AT+QXSCB=1,0", .events = msg("backlight 1 display_id:0")},
-    Case{.line = "AT+QXSCB=1,1", .events = msg("backlight 2 display_id:0")},
     Case{.line = "AT+QXSCB=1,2", .tag = "Refused", .fault = "testapp-refuse", .word = "ERROR",
          .events = msg("backlight 3 display_id:0", "error")},
     Case{.line = "AT+QXSCB=0", .events = msg("backlight 0 display_id:0")},
@@ -228,14 +211,11 @@ INSTANTIATE_TEST_SUITE_P(BacklightAndWake, DisplayLine, ::testing::Values(
          .word = "ATNG", .events = msg("backlight percentage 50 display_id:0", "fail")},
     Case{.line = "AT+QXSCB=2,101", .word = "ATNG"},
     Case{.line = "AT+QXSCB=2,-1", .word = "ATNG"},
-    Case{.line = "AT+QXSCB=2,", .word = "ATNG"},
     Case{.line = "AT+QXSCB=2,x", .word = "ATNG"},
     Case{.line = "AT+QXSCB=2,4294967346", .word = "ATNG"},
     Case{.line = "AT+QXSCB=3", .word = "ERROR"},
     Case{.line = "AT+QXSCB_BACK=1,2", .back = true, .events = msg("backlight 3 display_id:4096")},
-    Case{.line = "AT+QXSCB_BACK=0", .back = true, .events = msg("backlight 0 display_id:4096")},
     Case{.line = "AT+QXSCB_BACK=2,100", .back = true, .events = msg("backlight percentage 100 display_id:4096")},
-    Case{.line = "AT+QXSCB_BACK=2,101", .back = true, .word = "ATNG"},
     Case{.line = "AT+QXSCB_BACK=2,101", .tag = "OnePanel"},
     Case{.line = "AT+QXWAKE=1", .events = msg("wakeup 1 display_id:0")},
     Case{.line = "AT+QXWAKE=2", .tag = "Silent", .fault = "testapp-silent", .word = "ERROR",
@@ -247,7 +227,6 @@ INSTANTIATE_TEST_SUITE_P(BacklightAndWake, DisplayLine, ::testing::Values(
          .events = msg("wakeup 0 display_id:0", "ok?")},
     Case{.line = "AT+QXWAKE_BACK=0", .back = true, .replies = {{"wakeup 0 display_id:4096", "testing"}},
          .body = "\r\n\"wake:2\"\r\n", .events = msg("wakeup 0 display_id:4096", "testing")},
-    Case{.line = "AT+QXWAKE_BACK=2", .back = true, .events = msg("wakeup 2 display_id:4096")},
     Case{.line = "AT+QXWAKE_BACK=1", .tag = "OnePanel"},
     Case{.line = "AT+QXWAKE=3", .word = "ERROR"}), case_name);
 
@@ -330,11 +309,10 @@ INSTANTIATE_TEST_SUITE_P(PanelData, DisplayLine, ::testing::Values(
          .word = "ERROR"},
     Case{.line = "AT+QX_LCM_COLOR=1", .body = "invalid command: AT+QX_LCM_COLOR=1", .word = "ERROR"},
     Case{.line = "AT+SECSCREEN=0", .word = "ATOK", .events = "nv write\nsetprop ro.kael.secscreen=disable\n",
-         .nv_after = {{nv::kSpecialProduct, 0x959493D2}}, .props = {{"ro.kael.secscreen", "disable"}}},
+         .nv_after = {{nv::kSpecialProduct, 0x959493D2}}},
     Case{.line = "AT+SECSCREEN=1", .nv = {{nv::kSpecialProduct, 0xFFFFFFFF}}, .word = "ATOK",
          .events = "nv write\nsetprop ro.kael.secscreen=enable\n", .nv_after = {{nv::kSpecialProduct, 0xFFFFFFBF}}},
     Case{.line = "AT+SECSCREEN=0", .tag = "NvWriteFails", .fault = "nv-write", .word = "ATNG"},
-    Case{.line = "AT+SECSCREEN=1", .tag = "NvReadFails", .fault = "nv-read", .word = "ATNG"},
     Case{.line = "AT+SECSCREEN=2", .nv = {{nv::kSpecialProduct, 0x40}}, .body = "\"disable\"", .word = "ATOK"},
     Case{.line = "AT+SECSCREEN=2", .tag = "Enabled", .body = "\"enable\"", .word = "ATOK"},
     Case{.line = "AT+SECSCREEN=2", .tag = "NvReadFails", .fault = "nv-read", .word = "ATNG"},
@@ -375,48 +353,6 @@ TEST_F(DisplayTest, RestoreHappensOnce) {
               "setprop ro.sys.mainlcm.cali=14145496\n" + kLcm + "-e lcm_color W\n" + kLcm + "-e lcm_color R\n");
 }
 
-// A station polls a running test: each query sees the next state, and a screenless panel
-// is never asked through the test app.
-struct PollCase {
-    std::string name, line, what;
-    std::vector<std::string> values, bodies;
-    const char *key = nullptr;  // a factory key making the main panel screenless
-    std::vector<std::string> words = {};  // per answer; OK when empty
-};
-void PrintTo(const PollCase &c, std::ostream *os) { *os << c.name; }
-class DisplayPoll : public DisplayTest, public ::testing::WithParamInterface<PollCase> {};
-
-TEST_P(DisplayPoll, EachQuerySeesTheNextState) {
-    const PollCase &c = GetParam();
-    if (c.key) box.write(kKeyFile, c.key);
-    box.sequence(c.what, c.values);
-    for (size_t i = 0; i < c.bodies.size(); ++i) {
-        const std::string word = c.words.empty() ? "OK" : c.words[i];
-        const std::string frame = c.line + "\r\n" + c.bodies[i] + "\r\n" + word + "\r\n";
-        EXPECT_EQ(serve(c.line, SRC_TCP, frame.size()), frame) << "query " << i;
-    }
-    if (c.key) {
-        EXPECT_EQ(box.events().find("message"), std::string::npos) << box.events();
-    }
-}
-
-const std::string kTouchQuery = "touchscreen_selfcheck 0,display_id:0";
-const std::string kTs = "\r\n\"touchscreen:";
-
-// clang-format off
-INSTANTIATE_TEST_SUITE_P(Sequences, DisplayPoll, ::testing::Values(
-    PollCase{"TouchTestApp", "AT+QXTOUCH=0", "testapp:" + kTouchQuery, {"testing", "testing", "ok"},
-             {kTs + "2\"\r\n", kTs + "2\"\r\n", kTs + "1\"\r\n", kTs + "1\"\r\n"}},
-    PollCase{"TouchScreenless", "AT+QXTOUCH=0", kTestFile, {"testing", "Fail"},
-             {kTs + "2\"\r\n", kTs + "0\"\r\n"}, kBadScreen},
-    PollCase{"WakeUp", "AT+QXWAKE=0", "testapp:wakeup 0 display_id:0", {"testing", "error", "", "ok"},
-             {"\r\n\"wake:2\"\r\n", "\r\n\"wake:0\"\r\n", "", "\r\n\"wake:1\"\r\n"}, nullptr,
-             {"OK", "OK", "ERROR", "OK"}},
-    PollCase{"SensorTestRetried", "AT+QXTOUCH=1,3", "config:touchpanel_test.166", {"1", "0"}, {"", ""}, kBadScreen,
-             {"ERROR", "OK"}}),
-    [](const ::testing::TestParamInfo<PollCase> &info) { return info.param.name; });
-// clang-format on
-
 // The panel model takes only what its driver would: decimal 0x58RRGGBB, one line end
 // allowed; anything else leaves a lost calibration lost.
 struct PanelWrite {
@@ -440,38 +376,5 @@ INSTANTIATE_TEST_SUITE_P(Writes, PanelModel, ::testing::Values(
     PanelWrite{"Word", "white", "white -> rejected", kLost},
     PanelWrite{"TooLong", "99999999999", "99999999999 -> rejected", kLost}),
     [](const ::testing::TestParamInfo<PanelWrite> &info) { return info.param.name; });
-
-// The real daemon in AT mode on a two-panel phone: the keep-awake forms over TCP and the
-// local socket answer as the handlers do in-process.
-TEST(DisplayDaemon, AtModeKeepAwakeOverTheTransports) {
-    Sandbox box;
-    std::string items = "\"double_lcm_support\"";
-    sim::write_kv(box.path("/.sim/config"), "calibrate_items", &items);
-    Daemon d(box, "console-at=sendAT");
-    auto exchange = [](int fd, const std::string &line, size_t want) {
-        send(fd, line.data(), line.size(), MSG_NOSIGNAL);
-        return read_some(fd, want);
-    };
-    // The TCP station stays connected to the end: one that hangs up runs its hang-up
-    // command, whose answer goes to whichever source is current.
-    int tcp = d.connect_tcp();
-    ASSERT_GE(tcp, 0);
-    ASSERT_TRUE(d.wait_prop("sys.qrcode.view", "0"));
-    int local = -1;
-    for (int i = 0; i < 100 && (local = d.connect_local()) < 0; ++i)  // its listener starts last
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    ASSERT_GE(local, 0);
-    EXPECT_EQ(exchange(local, "AT+QXSP_BACK=0", 24), "AT+QXSP_BACK=0\r\n\r\nOK\r\n");
-    close(local);
-    EXPECT_EQ(box.read("/sys/lcm/oled_acl"), "0");
-    EXPECT_NE(box.events().find(kWake + msg("keep_screen_on 1,display_id:4096")), std::string::npos) << box.events();
-
-    // A station sends its TCP lines bare: a line end would stay part of the line.
-    const std::string refused = "AT+QXBS_BACK=1\r\n\r\nAT mode not support\r\n\r\nATERROR\r\n";
-    EXPECT_EQ(exchange(tcp, "AT+QXBS_BACK=1", refused.size()), refused);
-    EXPECT_EQ(exchange(tcp, "AT+QXBS=1", 17), "AT+QXBS=1\r\n\r\nOK\r\n");
-    EXPECT_EQ(box.read("/cache/recovery/last_test_info"), "keepscreen=yes\n");
-    close(tcp);
-}
 
 }  // namespace
