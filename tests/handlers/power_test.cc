@@ -346,7 +346,7 @@ TEST(PowerDaemon, AveragingBlocksEveryOtherChannel) {
     ASSERT_TRUE(d.wait_prop("sys.qrcode.view", "0"));
     const auto t0 = std::chrono::steady_clock::now();
     send(tcp, "AT+QX_PWR_CHG=2,10", 18, MSG_NOSIGNAL);  // a TCP station sends bare lines
-    std::this_thread::sleep_for(std::chrono::milliseconds(150));  // let the TCP line in first
+    ASSERT_TRUE(d.wait_log("recv line:AT+QX_PWR_CHG=2,10"));  // the TCP line is being served
     int local = d.connect_local();
     ASSERT_GE(local, 0);
     send(local, "AT+QXDLJ=0", 10, MSG_NOSIGNAL);
