@@ -33,7 +33,9 @@ Setup config(const std::string &key, const std::string &value) {
     return [=](const Sandbox &b) { sim::write_kv(b.root + "/.sim/config", key, &value); };
 }
 Setup says(const std::string &message, const std::string &reply) {  // the camera service's reply, ahead of the others
-    return [=](const Sandbox &b) { b.write("/.sim/camera.replies", message + " => " + reply + "\n" + b.read("/.sim/camera.replies")); };
+    return [=](const Sandbox &b) {
+        b.write("/.sim/camera.replies", message + " => " + reply + "\n" + b.read("/.sim/camera.replies"));
+    };
 }
 Setup put(const char *path, const std::string &text) { return [=](const Sandbox &b) { b.write(path, text); }; }
 Setup gone(const char *path) { return [=](const Sandbox &b) { std::filesystem::remove(b.path(path)); }; }

@@ -267,7 +267,8 @@ INSTANTIATE_TEST_SUITE_P(SideKeyVersion, KeyLine, ::testing::Values(
 
 // Each pressure key in turn must fire the vibrator's trigger.
 TEST_F(Keys, PressureKeysAgainstTheVibratorTrigger) {
-    for (const char *node : {"/sys/cs_press/cs_press/factory_mode", "/sys/cs_press/cs_press/cmd", kTrigger}) box.write(node, "0\n");
+    for (const char *node : {"/sys/cs_press/cs_press/factory_mode", "/sys/cs_press/cs_press/cmd", kTrigger})
+        box.write(node, "0\n");
     box.write("/.sim/events.log", "");
     expect_answer("AT+QX_KEY_VBR=1", "\r\n\"Volume up Key,Volume Down key,Power Key check OK !\"\r\n", "ATOK");
     std::vector<std::string> seq;

@@ -42,12 +42,8 @@ void expect_nv(const Sandbox &b, const Nv &fields) {
 
 using Setup = std::function<void(const Sandbox &)>;
 // Lines that override the script (the first line of a key wins).
-Setup script(const std::string &lines) {
-    return [=](const Sandbox &b) { b.write("/.sim/sensor", lines + "\n" + kScript); };
-}
-Setup fault(const char *name) {
-    return [=](const Sandbox &b) { b.fault(name); };
-}
+Setup script(const std::string &lines) { return [=](const Sandbox &b) { b.write("/.sim/sensor", lines + "\n" + kScript); }; }
+Setup fault(const char *name) { return [=](const Sandbox &b) { b.fault(name); }; }
 
 struct Case {
     std::string tag, line;

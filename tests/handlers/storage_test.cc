@@ -211,7 +211,8 @@ INSTANTIATE_TEST_SUITE_P(Otg, StorageLine, ::testing::Values(
     // Over TCP the station's line end stays in the line; it does not spoil the seconds.
     Case{"TcpLineEnd", "AT+QX_OTG_DEV=1,1\r\n", nullptr, "", "ATOK", {"message otg_test enable -> ok"}},
     Case{"Huge", "AT+QX_OTG_DEV=1,4294967297", nullptr, "\"para error\"", "ATNG", {}, "message"},
-    Case{"Refused", "AT+QX_OTG_DEV=1,600", kRefuse, "\"open otg error\"", "ATNG", {"message otg_test enable -> error"}, "setprop"},
+    Case{"Refused", "AT+QX_OTG_DEV=1,600", kRefuse, "\"open otg error\"", "ATNG", {"message otg_test enable -> error"},
+         "setprop"},
     Case{"Unset", "AT+QX_OTG_DEV=0", nullptr, "\"-1\"", "ATNG"},
     Case{"", "AT+QX_OTG_DEV=0", [](const Sandbox &b) { b.set_prop("sys.otg.dev", "1"); }, "", "ATOK"},
     Case{"NoDevice", "AT+QX_OTG_DEV=0", [](const Sandbox &b) { b.set_prop("sys.otg.dev", "0"); }, "\"0\"", "ATNG"},
@@ -249,7 +250,8 @@ TEST_P(OtgWorker, ReportsThroughItsProperty) {
     EXPECT_EQ(serve(line), frame(line, "", "ATOK"));
     ASSERT_TRUE(wait_workers(std::min(r.tries, 5) * 1000 + 3000));
     EXPECT_EQ(box.prop("sys.otg.dev"), r.found ? "1" : "0");
-    EXPECT_EQ(serve("AT+QX_OTG_DEV=0"), r.found ? frame("AT+QX_OTG_DEV=0", "", "ATOK") : frame("AT+QX_OTG_DEV=0", "\"0\"", "ATNG"));
+    EXPECT_EQ(serve("AT+QX_OTG_DEV=0"), r.found ? frame("AT+QX_OTG_DEV=0", "", "ATOK")
+                                                : frame("AT+QX_OTG_DEV=0", "\"0\"", "ATNG"));
     long long cleared = -1, set = -1;
     for (const Event &e : box.event_list()) {
         if (e.kind == "setprop" && e.detail == "sys.otg.dev=0") cleared = e.ms;
