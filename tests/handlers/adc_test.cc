@@ -59,11 +59,7 @@ protected:
         dispatch_command(buf, static_cast<int>(line.size()), SRC_TCP);
     }
     bool wait_workers_gone(int ms = 15000) {
-        for (auto end = Clock::now() + std::chrono::milliseconds(ms); Clock::now() < end;) {
-            if (sampling_workers_alive() == 0) return true;
-            std::this_thread::sleep_for(std::chrono::milliseconds(20));
-        }
-        return false;
+        return wait_until([] { return sampling_workers_alive() == 0; }, ms);
     }
     // Reads the channel until text has arrived n times (bounded); what arrived, and when
     // each arrival was seen.

@@ -36,11 +36,7 @@ long long event_ms(const Sandbox &b, const std::string &kind, const std::string 
 }
 
 bool wait_for(const Sandbox &b, const std::string &text, int ms = 5000) {
-    for (int waited = 0; waited < ms; waited += 10) {
-        if (b.events().find(text) != std::string::npos) return true;
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    return false;
+    return wait_until([&] { return b.events().find(text) != std::string::npos; }, ms);
 }
 
 // Sets one key of the audio library's script ("ftm.22", "-5").

@@ -24,12 +24,6 @@ const char *kCsTemp = "/sys/cs_press/cs_press/temperature";
 const char *kBatteryTemp = "/sys/class/power_supply/battery/temp";
 const char *kTrigger = "/sys/class/leds/vibrator/at_trigger_state";
 
-// Waits (bounded) until shown() holds; false when it never does.
-bool wait_for(const std::function<bool()> &shown, int ms = 3000) {
-    for (int waited = 0; waited < ms && !shown(); waited += 20) std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    return shown();
-}
-
 class Keys : public InProcess {
 protected:
     void SetUp() override {
@@ -48,7 +42,7 @@ protected:
     }
     void station(const std::string &line) { ASSERT_TRUE(sim::station_send(box.root, line)) << line; }
     bool captured(const std::string &text) {
-        return wait_for([&] { return box.read(kKeyCaptureFile) == text; });
+        return wait_until([&] { return box.read(kKeyCaptureFile) == text; });
     }
 };
 
@@ -107,7 +101,7 @@ TEST_F(Keys, SwitchesAndTouchAreTracked) {
     ASSERT_TRUE(captured("W"));
     EXPECT_EQ(input_switch_mask(), 0x2u);
     int32_t x = 0, y = 0;
-    EXPECT_TRUE(wait_for([&] { return input_touch_position(x, y), x == 120; }));  // the touch screen is another device
+    EXPECT_TRUE(wait_until([&] { return input_touch_position(x, y), x == 120; }));  // the touch screen is another device
     EXPECT_EQ(y, 340);
     exit_input_threads();
     ASSERT_EQ(create_input_threads(), 0);
@@ -188,7 +182,7 @@ TEST_P(KeyLine, Answers) {
     expect_answer(c.line, c.body, c.word);
     // The side-key controller's wake command reaches the model on its own thread.
     if (c.line == "AT+QX_KEY_CHK=0" && std::string(c.word) == "ATOK") {
-        EXPECT_TRUE(wait_for([&] { return box.events().find("sidekey write 0a\n") != std::string::npos; }));
+        EXPECT_TRUE(wait_until([&] { return box.events().find("sidekey write 0a\n") != std::string::npos; }));
     }
     const std::string log = box.events();
     expect_in_order(log, c.events);

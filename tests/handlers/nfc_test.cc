@@ -106,12 +106,10 @@ protected:
     }
     // A worker left running holds its open until it ends: wait (bounded) until it has.
     bool all_closed(int ms = 5000) const {
-        for (int waited = 0;; waited += 20) {
+        return wait_until([&] {
             Lines r = of("nfc");
-            if (std::count(r.begin(), r.end(), "open") == std::count(r.begin(), r.end(), "close")) return true;
-            if (waited >= ms) return false;
-            std::this_thread::sleep_for(std::chrono::milliseconds(20));
-        }
+            return std::count(r.begin(), r.end(), "open") == std::count(r.begin(), r.end(), "close");
+        }, ms);
     }
     long long at(const std::string &detail, int nth = 1) const {
         for (const auto &e : box.event_list())

@@ -71,11 +71,7 @@ protected:
         InProcess::TearDown();
     }
     bool wait_prop(const char *name, const std::string &value, int ms = 5000) {
-        for (auto end = Clock::now() + std::chrono::milliseconds(ms); Clock::now() < end;) {
-            if (box.prop(name) == value) return true;
-            std::this_thread::sleep_for(std::chrono::milliseconds(10));
-        }
-        return false;
+        return wait_until([&] { return box.prop(name) == value; }, ms);
     }
     void expect_answer(const std::string &line, const std::string &body, const std::string &word) {
         const std::string want = frame(line, body, word);

@@ -68,9 +68,7 @@ protected:
         InProcess::TearDown();
     }
     bool wait_workers(int ms) {
-        for (int waited = 0; waited < ms && otg_checks_running() > 0; waited += 25)
-            std::this_thread::sleep_for(std::chrono::milliseconds(25));
-        return otg_checks_running() == 0;
+        return wait_until([] { return otg_checks_running() == 0; }, ms);
     }
 };
 class StorageLine : public StorageTest, public ::testing::WithParamInterface<Case> {};

@@ -58,12 +58,8 @@ protected:
         box.write("/.sim/nv.bin", nv_pattern());
         box.write("/.sim/services", "com.pyxa.engineermode.DpdtService\ncom.android.phone.fastSearchNet.FastSearchNetService\n");
     }
-    bool wait_event(const std::string &text, int ms = 8000) {  // bounded; workers sleep 1-2 s first
-        for (int waited = 0; waited < ms; waited += 50) {
-            if (box.events().find(text) != std::string::npos) return true;
-            std::this_thread::sleep_for(std::chrono::milliseconds(50));
-        }
-        return false;
+    bool wait_event(const std::string &text, int ms = 8000) {  // workers sleep 1-2 s first
+        return wait_until([&] { return box.events().find(text) != std::string::npos; }, ms);
     }
 };
 class PowerLine : public PowerTest, public ::testing::WithParamInterface<Case> {};

@@ -56,8 +56,7 @@ TEST_P(SystemResetTest, AnswersAndEffects) {
     EXPECT_EQ(serve(c.line, SRC_TCP, want.size()), want);
     EXPECT_EQ(answer(1, 0), "");
     // The modem clean-up worker reports after the answer.
-    for (int i = 0; i < 100 && box.events().size() < c.events.size(); ++i)
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    wait_until([&] { return box.events().size() >= c.events.size(); }, 2000);
     EXPECT_EQ(box.events(), c.events);
     EXPECT_EQ(box.read("/.sim/nv.bin"), c.nv);
     EXPECT_EQ(box.exists("/cache/recovery/last_AT_adb.log"), !c.logs_gone);

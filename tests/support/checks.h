@@ -2,7 +2,10 @@
 // Checks that every handler family's tests share.
 #include <gtest/gtest.h>
 
+#include <chrono>
+#include <functional>
 #include <string>
+#include <thread>
 #include <vector>
 
 // The answer frame of a line: echo, body and result word, each followed by CR LF.
@@ -16,6 +19,16 @@ inline std::string nv_fill(unsigned char first, unsigned period) {
     std::string nv(1012, '\0');
     for (size_t i = 0; i < nv.size(); ++i) nv[i] = static_cast<char>(first + i % period);
     return nv;
+}
+
+// Polls until done() holds, for at most ms: true when it did. Workers and models act on
+// threads of their own, so their effects are awaited, never assumed after a fixed sleep.
+inline bool wait_until(const std::function<bool()> &done, int ms = 3000) {
+    for (auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);;) {
+        if (done()) return true;
+        if (std::chrono::steady_clock::now() >= end) return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
 }
 
 // The texts stand in the log in this order (each after the end of the one before).
