@@ -371,8 +371,11 @@ TEST_F(AudioTest, StopFormEndsARunningRecordingAtItsNextPoll) {
 
 TEST_F(AudioTest, RecordingIsCappedAtThirtySeconds) {
     // The phone's clock jumps under a 100 s take: at 29 s it records on, past 30 s it ends.
+    // The worker notes its start just after the busy mark: the first jump waits for the
+    // polls to run, so a late start reading cannot take the jump in.
     expect("AT+QX_AUD_RECD=0,MainMic,100", "", "ATOK");
     ASSERT_TRUE(wait_for(box, "setprop " + kMainBusy + "=1"));
+    EXPECT_FALSE(wait_for(box, "audio_ftm_process(51,0,0)", 300));
     box.write("/.sim/clock", "29\n");
     EXPECT_FALSE(wait_for(box, "audio_ftm_process(51,0,0)", 300));  // some thirty polls
     box.write("/.sim/clock", "31\n");
