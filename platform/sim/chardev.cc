@@ -263,13 +263,21 @@ int device_open(const char *device_path, int flags) {
     return sv[0];
 }
 
+// The open behind a descriptor the daemon holds, or nullptr. The number must still name
+// the same socket: a closed and reused number never reaches the old open. Under g_mu.
+static Session *session_of(int fd) {
+    auto at = g_by_fd.find(fd);
+    if (at == g_by_fd.end()) return nullptr;
+    struct stat st {};
+    if (fstat(fd, &st) != 0 || st.st_ino != at->second->client_ino || st.st_dev != at->second->client_dev)
+        return nullptr;
+    return at->second;
+}
+
 bool device_ioctl(int fd, unsigned long request, void *arg, int *result) {
     std::unique_lock<std::recursive_mutex> lk(g_mu);
-    auto at = g_by_fd.find(fd);
-    if (at == g_by_fd.end()) return false;
-    struct stat st {};
-    if (fstat(fd, &st) != 0 || st.st_ino != at->second->client_ino || st.st_dev != at->second->client_dev) return false;
-    Session *s = at->second;
+    Session *s = session_of(fd);
+    if (s == nullptr) return false;
     int err = 0;
     if (s->node || s->model->ioctl == nullptr) {
         *result = -1;
@@ -289,11 +297,8 @@ bool device_ioctl(int fd, unsigned long request, void *arg, int *result) {
 
 bool device_read(int fd, void *buf, size_t len, ssize_t *result) {
     std::unique_lock<std::recursive_mutex> lk(g_mu);
-    auto at = g_by_fd.find(fd);
-    if (at == g_by_fd.end()) return false;
-    struct stat st {};
-    if (fstat(fd, &st) != 0 || st.st_ino != at->second->client_ino || st.st_dev != at->second->client_dev) return false;
-    Session *s = at->second;
+    Session *s = session_of(fd);
+    if (s == nullptr) return false;
     if (s->node || s->model->read == nullptr) return false;
     errno = 0;
     bool was = t_in_model;
