@@ -10,11 +10,15 @@
 #include <strings.h>
 
 #include <array>
+#include <atomic>
+#include <chrono>
 #include <climits>
+#include <cstdint>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "core/command_tables/handlers.h"
@@ -51,8 +55,16 @@ constexpr char kRingEffect[] = "/sys/class/leds/aw22xxx_led/effect";
 constexpr char kRingCfg[] = "/sys/class/leds/aw22xxx_led/cfg";
 constexpr char kTestInfo[] = "/cache/recovery/last_test_info";
 constexpr char kAirplaneFailed[] = "\r\nexit airplane mode failed\r\n";
-// The instant vibration ends after 20 s anyway: longer times only keep the worker asleep.
-constexpr long long kMaxVibrateMs = 20000;
+// A stop and a quick restart can find the old worker still asleep in its pass: the
+// generation tells it that it was replaced, so it leaves without touching the flag or the
+// nodes that now belong to its successor.
+std::atomic<unsigned> g_instant_generation{0};
+std::atomic<unsigned> g_lights_generation{0};
+
+struct InstantTimes {
+    int on, interval;
+    unsigned generation;
+};
 
 // Boards whose green LED is driven through its engineering node.
 bool green_engineering() {
@@ -70,7 +82,7 @@ int call_handler(int (*handler)(char *, int, char *), const char *line) {
     char cmd[kLineSize] = {0};
     char scratch[kRespSize] = {0};
     strncpy(cmd, line, sizeof cmd - 1);
-    return handler(cmd, 0, scratch);
+    return handler(cmd, 36, scratch);  // the argument every table row carries
 }
 
 // AT+EDFT=0,5,level: the level is checked, but the panel always goes to its maximum.
@@ -126,13 +138,14 @@ int back_panel_off(char *resp) {
     return RC_ATOK;
 }
 
-// The two numbers after "AT+QX_VBR_STH_TS=1,"; false when either is missing or absurd.
+// The two numbers after "AT+QX_VBR_STH_TS=1,"; false when either is missing or is no
+// millisecond count (negative, not a number, beyond int).
 bool vibrate_times(const char *cmd, int times[2]) {
     auto fields = comma_fields(cmd);
     if (fields.size() < 3) return false;
     for (int i = 0; i < 2; ++i) {
         long long v = 0;
-        if (!leading_number(std::string(fields[1 + i]).c_str(), 0, kMaxVibrateMs, &v)) return false;
+        if (!leading_number(std::string(fields[1 + i]).c_str(), 0, INT_MAX, &v)) return false;
         times[i] = static_cast<int>(v);
     }
     return true;
@@ -153,18 +166,24 @@ void *update_vibrator_thread(void *) {
 }
 
 void *instant_vibrate_thread(void *arg) {
-    const int *times = static_cast<int *>(arg);
-    const int on = times[0], interval = times[1];
-    delete[] times;
-    LOGI("Start on %d interval %d", on, interval);
+    const InstantTimes times = *static_cast<InstantTimes *>(arg);
+    delete static_cast<InstantTimes *>(arg);
+    const auto current = [&] { return times.generation == g_instant_generation; };
+    LOGI("Start on %d interval %d", times.on, times.interval);
     g_vibrator_run = 1;
     long long total = 0;
-    while (g_vibrator_run) {
-        write_int(kVibDuration, on);
+    while (g_vibrator_run && current()) {
+        write_int(kVibDuration, times.on);
         write_int(kVibActivate, 1);
-        usleep(static_cast<useconds_t>(interval) * 1000);
-        total += on + interval;
+        // Milliseconds, not usleep: an interval above 4294 s would wrap usleep's argument.
+        std::this_thread::sleep_for(std::chrono::milliseconds(times.interval));
+        total += static_cast<long long>(times.on) + times.interval;
         if (total > 19999) break;
+    }
+    if (!current()) {
+        LOGI("Exit, replaced");
+        pthread_detach(pthread_self());
+        return nullptr;
     }
     g_vibrator_run = 0;
     write_int(kVibActivate, 0);
@@ -173,18 +192,22 @@ void *instant_vibrate_thread(void *arg) {
     return nullptr;
 }
 
-void *update_indicate_lights_thread(void *) {
+void *update_indicate_lights_thread(void *arg) {
+    const auto generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
+    const auto current = [&] { return generation == g_lights_generation; };
     LOGI("Start");
     const char *red = "/sys/class/leds/red/brightness";
     const char *green = green_node("/sys/class/leds/green/brightness");
-    for (unsigned pass = 0; g_lights_run; ++pass) {
+    for (unsigned pass = 0; g_lights_run && current(); ++pass) {
         write_int(red, 0);
         write_int(green, 0);
         write_int(pass % 2 == 0 ? red : green, 255);
         usleep(500 * 1000);
     }
-    write_int(red, 0);
-    write_int(green, 0);
+    if (current()) {
+        write_int(red, 0);
+        write_int(green, 0);
+    }
     LOGI("Exit");
     pthread_detach(pthread_self());
     return nullptr;
@@ -244,7 +267,10 @@ int vibrator_instant_handler(char *cmd, int, char *resp) {
         g_vibrator_run = 0;
         return RC_ATOK;
     }
-    if (!line_starts(cmd, "AT+QX_VBR_STH_TS=1", 18)) return invalid_command(cmd);
+    if (!line_starts(cmd, "AT+QX_VBR_STH_TS=1", 18)) {
+        LOGE("invalid command: %s", cmd);
+        return RC_ATERROR;
+    }
     if (g_vibrator_run) {
         body_printf(resp, "not stop");
         return RC_ATNG;
@@ -258,13 +284,13 @@ int vibrator_instant_handler(char *cmd, int, char *resp) {
         body_printf(resp, "time invalid");
         return RC_ATNG;
     }
-    int *arg = new (std::nothrow) int[2]{times[0], times[1]};
+    auto *arg = new (std::nothrow) InstantTimes{times[0], times[1], ++g_instant_generation};
     if (arg == nullptr) return RC_ATNG;
     // Raised here as well as in the worker, so a second start right after this one is
     // refused even before the worker has run.
     g_vibrator_run = 1;
     if (start_worker(instant_vibrate_thread, arg) != 0) {
-        delete[] arg;
+        delete arg;
         g_vibrator_run = 0;
         return RC_ATNG;
     }
@@ -300,7 +326,8 @@ int indicatelights_test_handler(char *cmd, int, char *) {
     if (line_is(cmd, "AT+QXLIGHT=1")) {
         if (g_lights_run) return RC_OK;
         g_lights_run = 1;
-        if (start_worker(update_indicate_lights_thread, nullptr) != 0) {
+        auto generation = static_cast<uintptr_t>(++g_lights_generation);
+        if (start_worker(update_indicate_lights_thread, reinterpret_cast<void *>(generation)) != 0) {
             g_lights_run = 0;
             return RC_ERROR;
         }

@@ -152,7 +152,8 @@ INSTANTIATE_TEST_SUITE_P(Lights, LightsLine, ::testing::Values(
     Case{"InstantOneTime", "AT+QX_VBR_STH_TS=1,500", "parameter invalid", "ATNG", ""},
     Case{"InstantNotNumbers", "AT+QX_VBR_STH_TS=1,a,b", "parameter invalid", "ATNG", ""},
     Case{"InstantHuge", "AT+QX_VBR_STH_TS=1,5,99999999999", "parameter invalid", "ATNG", ""},
-    Case{"InstantOther", "AT+QX_VBR_STH_TS=2", "", "ERROR", ""},
+    Case{"InstantOnAboveTwentySeconds", "AT+QX_VBR_STH_TS=1,25000,100", "time invalid", "ATNG", ""},
+    Case{"InstantOther", "AT+QX_VBR_STH_TS=2", "", "ATERROR", ""},
     Case{"LedsOff", "AT+MMILED=1,0", "", "OK", "led red/brightness 0\nled green/brightness 0\n"},
     Case{"LedRed", "AT+MMILED=1,1", "", "OK", "led green/brightness 0\nled red/brightness 255\n"},
     Case{"LedGreen", "AT+MMILED=1,2", "", "OK", "led red/brightness 0\nled green/brightness 255\n"},
@@ -249,6 +250,21 @@ TEST_F(LightsTest, InstantVibrationPulsesEveryIntervalUntilStopped) {
     ASSERT_FALSE(ev.empty());
     EXPECT_EQ(ev.back().detail, "vibrator/activate 0");
     EXPECT_EQ(g_vibrator_run, 0);
+}
+
+// A stop and a restart within one pass: the old worker leaves silently, so the new one's
+// pulses are neither doubled nor ended by the old one's last write.
+TEST_F(LightsTest, InstantRestartWithinAPassLeavesOneWorker) {
+    served("AT+QX_VBR_STH_TS=1,100,400", "", "ATOK");
+    leds(2);
+    served("AT+QX_VBR_STH_TS=0", "", "ATOK");
+    served("AT+QX_VBR_STH_TS=1,100,400", "", "ATOK");
+    auto ev = leds(8);  // the old worker's pulse, then three of the new one
+    ASSERT_GE(ev.size(), 8u) << box.events();
+    for (size_t i = 0; i < 8; ++i) EXPECT_NE(ev[i].detail, "vibrator/activate 0") << box.events();
+    for (size_t i = 4; i < 8; i += 2) EXPECT_GE(ev[i].ms - ev[i - 2].ms, 395) << box.events();
+    served("AT+QX_VBR_STH_TS=0", "", "ATOK");
+    ASSERT_TRUE(wait_workers_done(3000));
 }
 
 // The total ends the vibration by itself: after 20 s (2 x 10 s here) the worker stops.
