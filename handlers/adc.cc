@@ -98,7 +98,7 @@ bool factory_mode() {
 // Holds the charge level while sampling in the factory, and lets it go afterwards.
 void keep_charge_level(const char *level) {
     if (!factory_mode() || !dev::exists(kKeepChgSoc)) return;
-    if (write_policy_file(0, kKeepChgSoc, O_WRONLY | O_TRUNC, level) < 0) EM_LOGE("write error: %s", strerror(errno));
+    if (write_policy_file(0, kKeepChgSoc, O_RDWR, level) < 0) EM_LOGE("write error: %s", strerror(errno));
 }
 
 void limit_cores() {
