@@ -156,11 +156,13 @@ bool back_panel_missing(const char *cmd) {
     return true;
 }
 
-// The argument after the first comma, up to the next comma (cut there in place);
-// nullptr when there is none or it is empty.
+// The argument after the first comma as strtok gives it (empty fields skipped, as every
+// family splits its fields), cut at the next comma in place; nullptr when there is none.
 char *first_argument(char *cmd) {
     char *arg = strchr(cmd, ',');
-    if (arg == nullptr || *++arg == '\0' || *arg == ',') return nullptr;
+    if (arg == nullptr) return nullptr;
+    arg += strspn(arg, ",");
+    if (*arg == '\0') return nullptr;
     arg[strcspn(arg, ",")] = '\0';
     return arg;
 }
