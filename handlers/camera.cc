@@ -256,8 +256,8 @@ int gated_step(const GatedForm &form, char *resp) {
             return form.fail_rc;
         case Step::Mark: {
             const char *reply = sendMessageToCamera(form.message);
-            LOGI("%s reply: %s", form.message, reply);
-            if (strcasecmp(reply, "success") == 0) {
+            LOGI("%s reply: %s", form.message, reply ? reply : "(null)");
+            if (reply != nullptr && strcasecmp(reply, "success") == 0) {
                 touch_marker(form.marker);
                 return RC_OK;
             }
@@ -290,7 +290,7 @@ int text_message(const char *cmd, char *resp) {
 
 int front_light_leak(char *resp) {
     const char *reply = sendMessageToCamera("front_light_leak");
-    LOGI("front_light_leak reply: %s", reply);
+    LOGI("front_light_leak reply: %s", reply ? reply : "(null)");
     if (!camera_passed(reply)) return RC_ATERROR;
     std::string value = field_text(reply, "#", 2);
     body_printf(resp, "\r\n\"+Light:%s\"\r\n", value.c_str());
@@ -325,9 +325,9 @@ int camera_self_test(const char *cmd, char *resp, size_t action) {
              facing->data(), static_cast<int>(module->size()), module->data(), kSelfTestForms[action].action,
              static_cast<int>(first->size()), first->data(), tail.c_str());
     const char *reply = sendMessageToCamera(message.data());
-    LOGI("%s reply: %s", message.data(), reply);
+    LOGI("%s reply: %s", message.data(), reply ? reply : "(null)");
     if (!camera_passed(reply)) {
-        body_printf(resp, "%s", reply);
+        body_printf(resp, "%s", reply ? reply : "");
         return RC_ERROR;
     }
     if (action != kSelfTestResults) return RC_ATOK;
@@ -575,6 +575,6 @@ int set_camera_para_handler(char *cmd, int arg, char *resp) {
     char message[128];
     snprintf(message, sizeof message, "eng_AT_camera#NULL#NULL#focus_control#distance %s", distance.c_str());
     const char *reply = sendMessageToCamera(message);
-    LOGI("rsp = %s", reply);
+    LOGI("rsp = %s", reply ? reply : "(null)");
     return RC_ATOK;  // the focus is set whatever the service says
 }

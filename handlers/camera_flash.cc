@@ -60,12 +60,18 @@ int take_cell(void *cell) {
     return value;
 }
 
+void close_rear() {
+    set_led(kRearFlash1, 0);  // both names: the board has one of them
+    set_led(kRearFlash, 0);
+}
+void close_second() { set_led(kRearFlash2, 0); }
+void close_infrared() { set_led(kFrontFlash, 0); }
+
 void *rear_flash_close_thread(void *cell) {
     LOGI("Start");
     int ms = take_cell(cell);
     std::this_thread::sleep_for(std::chrono::milliseconds(ms));
-    set_led(kRearFlash1, 0);  // both names: the board has one of them
-    set_led(kRearFlash, 0);
+    close_rear();
     LOGI("Exit");
     pthread_detach(pthread_self());
     return nullptr;
@@ -75,7 +81,7 @@ void *second_flash_close_thread(void *cell) {
     LOGI("Start");
     int ms = take_cell(cell);
     std::this_thread::sleep_for(std::chrono::milliseconds(ms));
-    set_led(kRearFlash2, 0);
+    close_second();
     LOGI("Exit");
     pthread_detach(pthread_self());
     return nullptr;
@@ -85,15 +91,16 @@ void *infrared_close_thread(void *cell) {
     LOGI("Start");
     int seconds = take_cell(cell);
     std::this_thread::sleep_for(std::chrono::seconds(seconds));
-    set_led(kFrontFlash, 0);
+    close_infrared();
     LOGI("Exit");
     pthread_detach(pthread_self());
     return nullptr;
 }
 
 // Hands the delay to a timer in a heap cell that the timer frees; false when the cell
-// could not be allocated.
-bool start_timer(void *(*timer)(void *), int delay) {
+// could not be allocated. When the timer's thread cannot start, the light is closed at
+// once: a flash with no timer would stay on at pulse current.
+bool start_timer(void *(*timer)(void *), int delay, void (*close)()) {
     auto *cell = static_cast<int *>(malloc(sizeof(int)));
     if (cell == nullptr) {
         LOGE("timer cell malloc fail");
@@ -104,6 +111,7 @@ bool start_timer(void *(*timer)(void *), int delay) {
     if (rc != 0) {
         LOGE("start timer failed: %d", rc);
         free(cell);
+        close();
     }
     return true;
 }
@@ -194,7 +202,7 @@ int front_flashlight_test_handler(char *cmd, int arg, char *resp) {
     }
     if (line_is(cmd, "AT+QX_FLED_INF=3,1")) {
         set_led(kFrontFlash, kTorchLevel);
-        return start_timer(infrared_close_thread, kInfraredSeconds) ? RC_ATOK : RC_ATERROR;
+        return start_timer(infrared_close_thread, kInfraredSeconds, close_infrared) ? RC_ATOK : RC_ATERROR;
     }
     LOGE("this at command invalid: %s", cmd);
     return RC_ERROR;
@@ -223,7 +231,7 @@ int flashlight_amp_handler(char *cmd, int arg, char *resp) {
         // The front torch is closed only by AT+FLAMP=0,0; this timer closes the rear
         // flash, as the station's sequence has always relied on.
         set_led(kFrontFlash, kTorchLevel);
-        start_timer(rear_flash_close_thread, pulse_ms(cmd, kFrontTorchTimer));
+        start_timer(rear_flash_close_thread, pulse_ms(cmd, kFrontTorchTimer), close_rear);
         return RC_OK;
     }
     if (line_is(cmd, "AT+FLAMP=1,0")) {
@@ -233,7 +241,7 @@ int flashlight_amp_handler(char *cmd, int arg, char *resp) {
     }
     if (line_starts(cmd, "AT+FLAMP=1,1", 12)) {
         if (set_led(rear_main_flash(), kPulseLevel) != 0) return RC_ERROR;
-        start_timer(rear_flash_close_thread, pulse_ms(cmd, kRearPulseTimer));
+        start_timer(rear_flash_close_thread, pulse_ms(cmd, kRearPulseTimer), close_rear);
         return RC_OK;
     }
     if (line_is(cmd, "AT+FLAMP=2,0")) {
@@ -243,7 +251,7 @@ int flashlight_amp_handler(char *cmd, int arg, char *resp) {
     }
     if (line_starts(cmd, "AT+FLAMP=2,1", 12)) {
         if (set_led(kRearFlash2, kPulseLevel) != 0) return RC_ATNG;
-        start_timer(second_flash_close_thread, pulse_ms(cmd, kSecondPulseTimer));
+        start_timer(second_flash_close_thread, pulse_ms(cmd, kSecondPulseTimer), close_second);
         return RC_ATOK;
     }
     return invalid_command(cmd);
