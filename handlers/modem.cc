@@ -91,7 +91,7 @@ int dpdt_service_start() {
         rec.set_i32(nv::kDpdtService, 1);
         if (!nv::write(rec)) return RC_ERROR;
     }
-    startServiceFromFtcmd(kDpdtComponent, "", "");
+    startServiceFromFtcmd(kDpdtComponent, nullptr, nullptr);
     return RC_OK;
 }
 

@@ -13,6 +13,7 @@
 #include <bit>
 #include <climits>
 #include <cmath>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -295,10 +296,15 @@ int answer_property(const char *name, char *resp) {
     return RC_ATOK;
 }
 
-void *update_gsensor_z_thread(void *) {
+// A stop and a new start within one period would otherwise find the old stream awake
+// again with the flag set, and the station would get two readings each period.
+std::atomic<unsigned> g_gsensor_generation{0};
+
+void *update_gsensor_z_thread(void *arg) {
+    const auto generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
     LOGI("start");
     wait_for_current_answer();
-    while (g_gsensor_stream.load() == 1) {
+    while (g_gsensor_stream.load() == 1 && generation == g_gsensor_generation.load()) {
         ResultPtr r = new_result();
         if (!r) {
             LOGE("malloc fail!");
@@ -322,7 +328,8 @@ int start_z_stream() {
         return RC_OK;
     }
     g_gsensor_stream = 1;
-    int rc = start_worker(update_gsensor_z_thread, nullptr);
+    auto generation = static_cast<uintptr_t>(++g_gsensor_generation);
+    int rc = start_worker(update_gsensor_z_thread, reinterpret_cast<void *>(generation));
     if (rc != 0) {
         // The flag stays set, as after a stream that a failed reading ended: only
         // AT+QXZLJC=0,0 clears it.
