@@ -359,9 +359,12 @@ int write_wlan_mac(const char *cmd, char *resp) {
         LOGE("wrong format MAC:%s", field.c_str());
         return RC_ERROR;
     }
+    // Each line holds the 12 address characters: a longer value must not push the last line
+    // past the file's 120 bytes.
     char text[kWlanMacFileSize];
-    snprintf(text, sizeof text, "Intf0MacAddress=%s\nIntf1MacAddress=%s\nIntf2MacAddress=%s\nIntf3MacAddress=%s\n", mac.c_str(),
-             second.c_str(), mac.c_str(), mac.c_str());
+    snprintf(text, sizeof text,
+             "Intf0MacAddress=%.12s\nIntf1MacAddress=%.12s\nIntf2MacAddress=%.12s\nIntf3MacAddress=%.12s\n",
+             mac.c_str(), second.c_str(), mac.c_str(), mac.c_str());
     const char *written = nullptr;
     for (const char *file : kWlanMacFiles) {
         kaelatcmd_remove_system_file(file);

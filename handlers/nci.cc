@@ -76,9 +76,16 @@ int wait_readable(NciChannel &ch) {
 // One read of at most len bytes, bounded by the read limit; negative with errno on failure.
 ssize_t bounded_read(NciChannel &ch, uint8_t *into, size_t len) {
     if (wait_readable(ch) != 1) return -1;
+    // A driver without a poll method is "readable" at once and blocks in read itself: the
+    // tag-read worker must be endable there as well, and it holds no lock here either.
+    sigset_t usr2, old;
+    sigemptyset(&usr2);
+    sigaddset(&usr2, SIGUSR2);
+    pthread_sigmask(SIG_UNBLOCK, &usr2, &old);
     ssize_t n;
     do n = ::read(ch.fd, into, len);
     while (n < 0 && errno == EINTR);
+    pthread_sigmask(SIG_SETMASK, &old, nullptr);
     return n;
 }
 
