@@ -238,7 +238,7 @@ struct ModeCase {
     const char *flags;    // the mode line
     const char *cmdline;  // expected in proc/cmdline ("": no console-at key at all)
     bool uart;
-    int enters_assembly;  // -1: not checked
+    bool enters_assembly;  // sets the assembly mode property anew
 };
 void PrintTo(const ModeCase &c, std::ostream *os) { *os << c.name; }
 
@@ -261,22 +261,20 @@ TEST_P(ModeTest, WritesTheCommandLineAndServesTheUartOnlyWhenUsed) {
     if (c.uart) {
         EXPECT_EQ(at({"--serial", sim.station("ttyMSM0"), "AT+QXWLAN"}).out, kNotSupportedBare);
     }
-    if (c.enters_assembly >= 0) {
-        EXPECT_EQ(box.events().find("setprop sys.factory.assembly_at_mode=1") != std::string::npos, c.enters_assembly == 1);
-    }
+    EXPECT_EQ(box.events().find("setprop sys.factory.assembly_at_mode=1") != std::string::npos, c.enters_assembly);
 }
 
 INSTANTIATE_TEST_SUITE_P(
     Launcher, ModeTest,
     ::testing::Values(
-        ModeCase{"Plain", {"--mode", "plain"}, "plain (is_uart_flag 0, is_sp 0)", "", false, -1},
-        ModeCase{"At", {"--mode", "at"}, "at (is_uart_flag 1, is_sp 1)", " console-at=sendAT\n", true, -1},
-        ModeCase{"Normal", {"--mode", "normal"}, "normal (is_uart_flag 1, is_sp 0)", " console-at=sendNormal\n", true, -1},
-        ModeCase{"AssemblyNewBoot", {"--mode", "assembly"}, "assembly (is_uart_flag 0, is_sp 1)", " console-at=sendAT_assembly\n", false, 1},
+        ModeCase{"Plain", {"--mode", "plain"}, "plain (is_uart_flag 0, is_sp 0)", "", false, false},
+        ModeCase{"At", {"--mode", "at"}, "at (is_uart_flag 1, is_sp 1)", " console-at=sendAT\n", true, false},
+        ModeCase{"Normal", {"--mode", "normal"}, "normal (is_uart_flag 1, is_sp 0)", " console-at=sendNormal\n", true, false},
+        ModeCase{"AssemblyNewBoot", {"--mode", "assembly"}, "assembly (is_uart_flag 0, is_sp 1)", " console-at=sendAT_assembly\n", false, true},
         ModeCase{"AssemblySameBoot", {"--mode", "assembly", "--keep-boot"}, "assembly (is_uart_flag 0, is_sp 1)",
-                 " console-at=sendAT_assembly\n", false, 0},
+                 " console-at=sendAT_assembly\n", false, false},
         ModeCase{"WholeCommandLine", {"--cmdline", "quiet console-at=sendAT"}, "at (is_uart_flag 1, is_sp 1)",
-                 "quiet console-at=sendAT\n", true, -1}),
+                 "quiet console-at=sendAT\n", true, false}),
     [](const auto &i) { return std::string(i.param.name); });
 
 TEST(Tools, TwoPhonesSideBySideStopOnTheirSignals) {
