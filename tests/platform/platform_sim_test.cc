@@ -179,7 +179,8 @@ INSTANTIATE_TEST_SUITE_P(
                       ExtCase{"btnvtool -b F6.E5.D4.C3.B2.A1", 64, "", "", "/mnt/vendor/persist/bluetooth/.bt_nv.bin",
                               std::string("\x01\x00\x06\xF6\xE5\xD4\xC3\xB2\xA1", 9)},
                       ExtCase{"/system/bin/bdt entrydut 2>&1", 64, "", "", "bluetooth.bdt.kaeldut", "true"},
-                      ExtCase{"/system/bin/sh -c \"/system/bin/bdt exitdut\"", 64, "", "", "bluetooth.bdt.kaeldut", "false"}));
+                      ExtCase{"/system/bin/sh -c \"/system/bin/bdt exitdut\"", 64, "", "", "bluetooth.bdt.kaeldut",
+                              "false"}));
 
 // "verdict,v0,v1,v2,v3" of a sensor test whose record was preset with a stray value.
 std::string sensor(int id) {
