@@ -52,7 +52,6 @@ INSTANTIATE_TEST_SUITE_P(
                       ReplyCase{"shutdown * => yes\nshutdown delay => later\n", "", "shutdown delay", "later"},
                       ReplyCase{"* => any\nshutdown * => some\n", "", "shutdown immediately", "some"},
                       ReplyCase{"sim_state => (silent)\n* => ok\n", "", "sim_state", nullptr},
-                      ReplyCase{"# nothing\n", "", "emerg_call", nullptr},
                       ReplyCase{"* => ok\n", "testapp-silent", "emerg_call", nullptr},
                       ReplyCase{"* => ok\n", "testapp-refuse", "emerg_call", "error"}));
 
@@ -149,12 +148,15 @@ struct ExtCase {
     const char *command;
     int size;
     const char *preset, *output;  // the buffer before and after
+    const char *where = nullptr;  // a file, or else a property, that the command sets
+    std::string effect = "";
 };
 void PrintTo(const ExtCase &c, std::ostream *os) { *os << c.command; }
 
 class ExtSystem : public SimTest, public ::testing::WithParamInterface<ExtCase> {};
 
-// Scripted, emulated and unknown commands; silence keeps the preset, output is cut to the size.
+// Scripted, emulated and unknown commands; silence keeps the preset, output is cut to the size;
+// the Bluetooth tools act on the sandbox.
 TEST_P(ExtSystem, CapturesOutput) {
     const ExtCase &c = GetParam();
     box.write("/sdcard/a.txt", std::string(3000, 'a'));
@@ -163,6 +165,7 @@ TEST_P(ExtSystem, CapturesOutput) {
     snprintf(buf, sizeof buf, "%s", c.preset);
     ext_system(c.command, buf, c.size);
     EXPECT_STREQ(buf, c.output);
+    EXPECT_EQ(!c.where ? "" : *c.where == '/' ? box.read(c.where) : box.prop(c.where), c.effect);
 }
 
 INSTANTIATE_TEST_SUITE_P(
@@ -172,19 +175,13 @@ INSTANTIATE_TEST_SUITE_P(
                       ExtCase{"cat /sys/kernel/debug/stm32l011/in_version", 64, "", "7\n"},
                       ExtCase{"du -sk /sdcard/", 64, "", "3\t/sdcard/\n"}, ExtCase{"ps|grep stressapptest", 64, "keep", "keep"},
                       ExtCase{"cat /persist/wlan_mac.bin | grep Intf1", 64, "", "Intf1MacAddress=02A0C6112233\n"},
-                      ExtCase{"echo 0123456789abcdefXYZ", 16, "", "0123456789abcde"}));
+                      ExtCase{"echo 0123456789abcdefXYZ", 16, "", "0123456789abcde"},
+                      ExtCase{"btnvtool -b F6.E5.D4.C3.B2.A1", 64, "", "", "/mnt/vendor/persist/bluetooth/.bt_nv.bin",
+                              std::string("\x01\x00\x06\xF6\xE5\xD4\xC3\xB2\xA1", 9)},
+                      ExtCase{"/system/bin/bdt entrydut 2>&1", 64, "", "", "bluetooth.bdt.kaeldut", "true"},
+                      ExtCase{"/system/bin/sh -c \"/system/bin/bdt exitdut\"", 64, "", "", "bluetooth.bdt.kaeldut",
+                              "false"}));
 
-TEST_F(SimTest, BluetoothToolsActOnTheSandbox) {
-    char out[256] = "";
-    ext_system("btnvtool -b F6.E5.D4.C3.B2.A1", out, sizeof out);
-    EXPECT_EQ(box.read("/mnt/vendor/persist/bluetooth/.bt_nv.bin"), std::string("\x01\x00\x06\xF6\xE5\xD4\xC3\xB2\xA1", 9));
-    ext_system("/system/bin/bdt entrydut 2>&1", out, sizeof out);
-    EXPECT_EQ(box.prop("bluetooth.bdt.kaeldut"), "true");
-    ext_system("/system/bin/sh -c \"/system/bin/bdt exitdut\"", out, sizeof out);
-    EXPECT_EQ(box.prop("bluetooth.bdt.kaeldut"), "false");
-}
-
-std::string camera(const char *message) { return sendMessageToCamera(message); }
 // "verdict,v0,v1,v2,v3" of a sensor test whose record was preset with a stray value.
 std::string sensor(int id) {
     SensorTestResult r{};
@@ -217,10 +214,10 @@ TEST_F(SimTest, LibrariesAnswerFromTheirScriptsAndFailOnFaults) {
     box.write("/.sim/sensor", "48=1,12.5,-7,25\n49=0,1,2,3\n51=absent\n");
     box.write("/.sim/modem", "em.118=6\nnv.26693=3\ngps.2=+QXGPS: 12\n");
     box.write("/.sim/audio", "exitSendTest=5\nftm.22=7\n");
-    EXPECT_EQ(camera("capture"), "success");
-    EXPECT_EQ(camera("eng_AT_camera#rear#main#auto_test_get_result#params 0"), "success#r#af 1");
-    EXPECT_EQ(camera("eng_AT_camera#rear#tele#open#NULL#NULL"), "fail#generic");
-    EXPECT_EQ(camera("stop"), "fail#no reply scripted");
+    EXPECT_STREQ(sendMessageToCamera("capture"), "success");
+    EXPECT_STREQ(sendMessageToCamera("eng_AT_camera#rear#main#auto_test_get_result#params 0"), "success#r#af 1");
+    EXPECT_STREQ(sendMessageToCamera("eng_AT_camera#rear#tele#open#NULL#NULL"), "fail#generic");
+    EXPECT_STREQ(sendMessageToCamera("stop"), "fail#no reply scripted");
     EXPECT_EQ(sensor(48), "1,125,-70,250,0");
     EXPECT_EQ(sensor(49), "0,10,20,30,0");
     EXPECT_EQ(sensor(51), "failed");
@@ -243,7 +240,7 @@ TEST_F(SimTest, LibrariesAnswerFromTheirScriptsAndFailOnFaults) {
     EXPECT_EQ(box.read("/data/media/0/engineermode/main-record.wav").substr(0, 4), "RIFF");
 
     for (const char *f : {"camera", "sensor", "modem", "audio"}) box.fault(f);
-    EXPECT_EQ(camera("capture").find("success"), std::string::npos);
+    EXPECT_EQ(std::string(sendMessageToCamera("capture")).find("success"), std::string::npos);
     EXPECT_TRUE(recorded("camera capture -> success"));
     EXPECT_EQ(sensor(48) + em(118) + gps(2), "failedfailedfailed");
     EXPECT_NE(startMainEchoTest(), 0);

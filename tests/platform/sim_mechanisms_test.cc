@@ -2,16 +2,13 @@
 // the record of effects, and values that change from one read or call to the next.
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <unistd.h>
 
-#include <cerrno>
 #include <chrono>
 #include <functional>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include "platform/android.h"
 #include "platform/audio.h"
 #include "platform/device.h"
 #include "platform/factory.h"
@@ -42,19 +39,13 @@ void through_fopen(const char *p, const char *mode) {
     fclose(f);
 }
 
+// One writer per way the open flags reach the file: plain, read-write, truncating, appending, stdio.
 const Writer kWriters[] = {
-    {"WritePolicyFile", [](const char *p) { write_policy_file(0, p, O_WRONLY, "100"); }, "10045\n"},
     {"WritePolicyFileReadWrite", [](const char *p) { write_policy_file(0, p, O_RDWR, "100"); }, "10045\n"},
-    {"WriteInt", [](const char *p) { write_int(p, 100); }, "100"},
-    {"SystemFileAppend", [](const char *p) { kaelatcmd_write_system_file(p, O_WRONLY | O_CREAT | O_APPEND, "100"); }, "12345\n100"},
     {"WriteNode", [](const char *p) { dev::write_node(p, "100"); }, "10045\n"},
-    {"RawOpenWrite",
-     [](const char *p) {
-         int fd = dev::open(p, O_WRONLY);
-         EXPECT_EQ(::write(fd, "100", 3), 3);
-         ::close(fd);
-     },
-     "10045\n"},
+    {"WriteInt", [](const char *p) { write_int(p, 100); }, "100"},
+    {"SystemFileAppend", [](const char *p) { kaelatcmd_write_system_file(p, O_WRONLY | O_CREAT | O_APPEND, "100"); },
+     "12345\n100"},
     {"FopenUpdate", [](const char *p) { through_fopen(p, "r+"); }, "10045\n"},
     {"FopenAppend", [](const char *p) { through_fopen(p, "a"); }, "12345\n100"},
 };
@@ -64,11 +55,13 @@ struct Node {
     bool attribute;
 };
 
+// One node per top directory that holds attributes, a regular file, and relative spellings.
 const Node kNodes[] = {
-    {"Sysfs", "/sys/class/power_supply/battery/keep_chg_soc", true}, {"SysfsRelative", "sys/lcm/oled_acl", true},
-    {"Procfs", "/proc/sysrq-trigger", true},          {"Regmap", "/d/regmap/spmi0-00/data", true},
-    {"Debugfs", "/sys/kernel/debug/cms/debug", true}, {"DataFile", "/data/vendor/engineermode/bt_device", false},
-    {"PersistFile", "/persist/wlan_mac.bin", false},  {"CacheFile", "cache/recovery/last_atcmd0", false},
+    {"SysfsRelative", "sys/lcm/oled_acl", true},
+    {"Procfs", "/proc/sysrq-trigger", true},
+    {"Regmap", "/d/regmap/spmi0-00/data", true},
+    {"DataFile", "/data/vendor/engineermode/bt_device", false},
+    {"CacheFile", "cache/recovery/last_atcmd0", false},
 };
 
 class NodeWrites : public Mechanisms, public ::testing::WithParamInterface<std::tuple<int, int>> {};
@@ -89,13 +82,10 @@ INSTANTIATE_TEST_SUITE_P(WriterByNode, NodeWrites,
                              return std::string(kWriters[std::get<0>(i.param)].name) + "_" + kNodes[std::get<1>(i.param)].name;
                          });
 
-TEST_F(Mechanisms, AttributeWriteNeverCreatesAMissingNode) {
-    EXPECT_LT(write_policy_file(0, "/sys/class/leds/absent/brightness", O_WRONLY, "1"), 0);
+// A missing attribute node is never created; a sysrq write is recorded and keeps errno.
+TEST_F(Mechanisms, MissingAttributeStaysMissingSysrqKeepsErrno) {
     EXPECT_NE(write_int("/sys/class/leds/absent/brightness", 1), 0);
     EXPECT_FALSE(box.exists("/sys/class/leds/absent/brightness"));
-}
-
-TEST_F(Mechanisms, SysrqRecordKeepsErrno) {
     errno = EAGAIN;
     ASSERT_EQ(write_policy_file(0, "/proc/sysrq-trigger", 2, "c"), 0);
     EXPECT_EQ(errno, EAGAIN);
@@ -147,10 +137,33 @@ TEST_F(Mechanisms, TimeBaseIsSharedThroughTheSandbox) {
 }
 
 std::string text_of(const char *r) { return r ? r : "(none)"; }
+std::string node_text(const char *path) {
+    std::string s;
+    dev::read_node(path, s);
+    return s;
+}
+std::string fopen_line(const char *path) {
+    char buf[16] = "";
+    FILE *f = dev::fopen(path, "r");
+    if (!f) return "(none)";
+    if (!fgets(buf, sizeof buf, f)) buf[0] = '\0';
+    fclose(f);
+    return buf;
+}
 std::string shell_out(const char *cmd) {
-    char buf[32] = "";
+    char buf[32] = "(none)";
     ext_system(cmd, buf, sizeof buf);
     return buf;
+}
+std::string sensor48() {
+    SensorTestResult r{};
+    if (kael_sensor_factory_test(48, &r, 0, 0) != 0) return "absent";
+    return std::to_string(r.success) + "," + std::to_string(static_cast<int>(r.value[0]));
+}
+std::string em118() {
+    char reply[ZDR_EM_REPLY_SIZE] = {0};
+    qmi_zdr_set_em_status(118, reply);
+    return reply;
 }
 
 struct SeqCase {
@@ -160,50 +173,36 @@ struct SeqCase {
 };
 void PrintTo(const SeqCase &c, std::ostream *os) { *os << c.name; }
 
+// One row per place that takes sequence values; the shell row also carries the texts that need escaping.
 const SeqCase kSeqCases[] = {
     {"Node", "/sys/class/power_supply/usb/online", {"1", "0", "1"},
-     [] {
-         std::string s;
-         dev::read_node("/sys/class/power_supply/usb/online", s);
-         return s;
-     }},
+     [] { return node_text("/sys/class/power_supply/usb/online"); }},
     {"NodeByFopen", "sys/class/power_supply/battery/capacity", {"87", "15"},
-     [] {
-         char buf[16] = "";
-         FILE *f = dev::fopen("/sys/class/power_supply/battery/capacity", "r");
-         if (!f) return std::string("(none)");
-         if (!fgets(buf, sizeof buf, f)) buf[0] = '\0';
-         fclose(f);
-         return std::string(buf);
-     }},
-    {"NodeByShellCat", "/sys/class/power_supply/usb/online", {"0", "1"}, [] { return shell_out("cat /sys/class/power_supply/usb/online"); }},
-    {"TestApp", "testapp:battery_mode get", {"busy", "(silent)", "ok"}, [] { return text_of(sendMessage("battery_mode get")); }},
+     [] { return fopen_line("/sys/class/power_supply/battery/capacity"); }},
+    {"NodeByShellCat", "/sys/class/power_supply/usb/online", {"0", "1"},
+     [] { return shell_out("cat /sys/class/power_supply/usb/online"); }},
+    {"TestApp", "testapp:battery_mode get", {"busy", "(silent)", "ok"},
+     [] { return text_of(sendMessage("battery_mode get")); }},
     {"TestAppPattern", "testapp:shutdown *", {"busy", "ok"}, [] { return text_of(sendMessage("shutdown delay")); }},
-    {"Camera", "camera:capture", {"fail#busy", "success#capture"}, [] { return text_of(sendMessageToCamera("capture")); }},
-    {"Shell", "shell:ftcmd_camera", {"0,0,0,0", "1,1,1,1"}, [] { return shell_out("ftcmd_camera"); }},
-    {"Sensor", "sensor:48", {"0,1", "1,2", "absent"},
-     [] {
-         SensorTestResult r{};
-         if (kael_sensor_factory_test(48, &r, 0, 0) != 0) return std::string("absent");
-         return std::to_string(r.success) + "," + std::to_string(static_cast<int>(r.value[0]));
-     }},
+    {"Camera", "camera:capture", {"fail#busy", "success#capture"},
+     [] { return text_of(sendMessageToCamera("capture")); }},
+    {"Shell", "shell:getprop x", {"line1\nline2", "#hash", "", "back\\slash", "[not a name]"},
+     [] { return shell_out("getprop x"); }},
+    {"Sensor", "sensor:48", {"0,1", "1,2", "absent"}, sensor48},
     {"Audio", "audio:startMainEchoTest", {"-1", "0"}, [] { return std::to_string(startMainEchoTest()); }},
-    {"Modem", "modem:em.118", {"6", "0"},
-     [] {
-         char reply[ZDR_EM_REPLY_SIZE] = {0};
-         qmi_zdr_set_em_status(118, reply);
-         return std::string(reply);
-     }},
-    {"Config", "config:project", {"RX3310", "WQ2207"}, [] { return std::string(is_project("WQ2207") ? "WQ2207" : "RX3310"); }},
+    {"Modem", "modem:em.118", {"6", "0"}, em118},
+    {"Config", "config:project", {"RX3310", "WQ2207"},
+     [] { return std::string(is_project("WQ2207") ? "WQ2207" : "RX3310"); }},
 };
 
 class Sequences : public Mechanisms, public ::testing::WithParamInterface<SeqCase> {};
 
 // Values come in order, the last repeats, and setting the sequence again starts it over.
+// A node reads its value as a line; no answer (silent, or an empty shell output) leaves "(none)".
 TEST_P(Sequences, ReadInOrderThenTheLastRepeats) {
     const SeqCase &c = GetParam();
     bool node = c.what[0] == '/' || std::string(c.what).rfind("sys/", 0) == 0;
-    auto expected = [&](const std::string &v) { return node ? v + "\n" : v == "(silent)" ? "(none)" : v; };
+    auto expected = [&](const std::string &v) { return node ? v + "\n" : v.empty() || v == "(silent)" ? "(none)" : v; };
     box.sequence(c.what, c.values);
     for (size_t i = 0; i < c.values.size() + 2; ++i)
         EXPECT_EQ(c.read(), expected(c.values[std::min(i, c.values.size() - 1)])) << "read " << i;
@@ -227,15 +226,6 @@ TEST_F(Mechanisms, SequenceStateLivesInTheSandbox) {
     EXPECT_STREQ(sendMessage("go_to_sleep"), "wait");
     box.sequence("testapp:go_to_sleep", {});
     EXPECT_STREQ(sendMessage("go_to_sleep"), "ok");
-}
-
-TEST_F(Mechanisms, SequenceValuesKeepSpecialText) {
-    box.sequence("shell:getprop x", {"line1\nline2", "#hash", "", "back\\slash", "[not a name]"});
-    for (const char *want : {"line1\nline2", "#hash", "preset", "back\\slash", "[not a name]"}) {  // empty: preset stays
-        char buf[64] = "preset";
-        ext_system("getprop x", buf, sizeof buf);
-        EXPECT_STREQ(buf, want);
-    }
 }
 
 }  // namespace
