@@ -51,9 +51,7 @@ auto mkdir(std::string p) { return [=](S t) { std::filesystem::create_directorie
 auto gone(std::string p) { return [=](S t) { std::filesystem::remove_all(t.box.path(p)); }; }
 auto uart(int sp) { return [=](S) { is_uart_flag = 1, is_sp = sp; }; }
 auto clock_at(time_t at) { return [=](S t) { t.box.write("/.sim/clock", std::to_string(at - time(nullptr))); }; }
-auto booted_ago(long n) {
-    return [=](S t) { t.box.set_prop("sys.boot_completed.time", std::to_string(time(nullptr) - n)); };
-}
+auto booted_ago(long n) { return [=](S t) { prop("sys.boot_completed.time", std::to_string(time(nullptr) - n))(t); }; }
 auto nv_put(size_t off, std::string b) {
     return [=](S t) { t.box.write("/.sim/nv.bin", t.nv().replace(off, b.size(), b)); };
 }
@@ -136,7 +134,6 @@ INSTANTIATE_TEST_SUITE_P(Time, SystemInfo, ::testing::Values(
     Case{"padded_day", "AT+QXSJ=0", {clock_at(1793610307)}, "\r\n\"2026-11-2\"\r\n\"09:05:07\"\r\n\"1\"\r\n", "OK"},
     Case{"december", "AT+QXSJ=0", {clock_at(1767225598)}, "\r\n\"2025-12-31\"\r\n\"23:59:58\"\r\n\"3\"\r\n", "OK"},
     Case{"no_file", "AT+QXSJ=0", {gone("/data/vendor/engineermode")}, "", "ERROR"},
-    Case{"set", kSet, {}, "", "OK", {event("clock 1794749069\n")}},
     Case{"set_quoted", "AT+QXSJ=1,\"2026-11-15 13:24:29\"", {}, "", "OK", {event("clock 1794749069\n")}},
     Case{"set_refused", kSet, {fault("clock")}, "", "ERROR"},
     Case{"set_tcp_line_end", "AT+QXSJ=1,2026,11,15,13,24,29\r\n", {}, "", "OK", {event("clock 1794749069\n")}},
@@ -163,20 +160,17 @@ INSTANTIATE_TEST_SUITE_P(Identity, SystemInfo, ::testing::Values(
 auto radio(const char *abbr) { return prop("persist.kael.radio.type.abbr", abbr); }
 const std::string kUsb = "/sys/class/power_supply/usb/power_now";
 INSTANTIATE_TEST_SUITE_P(Hardware, SystemInfo, ::testing::Values(
-    Case{"ram", "AT+QXRAM=0", {}, q("5663"), "OK"},
     Case{"ram_prefix", "AT+QXRAM=0,1", {file("/proc/meminfo", "MemTotal: 2097151 kB\n")}, q("2047"), "OK"},
     Case{"ram_no_total", "AT+QXRAM=0", {file("/proc/meminfo", "MemFree: 1 kB\n")}, "", "ERROR"},
     Case{"ram_missing", "AT+QXRAM=0", {gone("/proc/meminfo")}, "", "ERROR"},
     Case{"flash_ufs", "AT+QXFQ=0", {}, q("119.25"), "OK"},
     Case{"flash_emmc", "AT+QXFQ=0", {gone("/sys/block/sda")}, q("58.24"), "OK"},
     Case{"flash_none", "AT+QXFQ=0", {gone("/sys/block/sda"), gone("/sys/class/block/mmcblk0/size")}, "", "ERROR"},
-    Case{"usb3", "AT+QXUSB=0", {file(kUsb, "5\n")}, q("3"), "OK"},
     Case{"usb2", "AT+QXUSB=0", {file(kUsb, "3\n")}, q("2"), "OK"},
-    Case{"usb_other", "AT+QXUSB=0", {file(kUsb, "4\n")}, q("0"), "OK"},
     Case{"usb_missing", "AT+QXUSB=0", {gone(kUsb)}, "", "ERROR"},
-    // Longer than the 5 bytes read: a read past the buffer shows in the sanitizer build.
-    Case{"usb_long_node", "AT+QXUSB=0", {file(kUsb, "5\n123456789\n")}, q("3"), "OK"},
-    Case{"usb_long_value", "AT+QXUSB=0", {file(kUsb, "123456789\n")}, q("0"), "OK"},
+    // Longer than the 5 bytes read (5: USB 3, other values: 0); a read past the buffer shows in the sanitizer build.
+    Case{"usb3_long_node", "AT+QXUSB=0", {file(kUsb, "5\n123456789\n")}, q("3"), "OK"},
+    Case{"usb_other_long_value", "AT+QXUSB=0", {file(kUsb, "123456789\n")}, q("0"), "OK"},
     Case{"radio_E", "AT+QXRADIO=0", {radio("E")}, q("EVD0+GSM"), "OK"},
     Case{"radio_h", "AT+QXRADIO=0", {radio("h")}, q("FDD-LTE+TDD-LTE+WCDMA+GSM"), "OK"},
     Case{"radio_A", "AT+QXRADIO=0", {radio("A")}, q("TDD-LTE+FDD-LTE+WCDMA+TD+GSM"), "OK"},
@@ -185,32 +179,27 @@ INSTANTIATE_TEST_SUITE_P(Hardware, SystemInfo, ::testing::Values(
     Case{"radio_unknown", "AT+QXRADIO=0", {radio("Z")}, "", "OK"},
     Case{"cpu_missing", "AT+QXBBTYPE=0", {gone("/sys/devs_list/mpps_value")}, "", "ERROR"}), name_of);
 
+const std::string kKs = "keepscreen=1\n", kSetFail = q("set value failed");
 INSTANTIATE_TEST_SUITE_P(CacheProp, SystemInfo, ::testing::Values(
     Case{"set", "AT+QX_CACHE_PROP=1,step,42", {}, "", "ATOK", {file_is(kInfo, "step=42\n")}},
-    Case{"get", "AT+QX_CACHE_PROP=0,step", {file(kInfo, "keepscreen=1\nstep=42\n")}, q("42"), "ATOK"},
+    Case{"get", "AT+QX_CACHE_PROP=0,step", {file(kInfo, kKs + "step=42\n")}, q("42"), "ATOK"},
     Case{"get_none", "AT+QX_CACHE_PROP=0,step", {}, q("get value failed!"), "ATNG"},
     Case{"no_key", "AT+QX_CACHE_PROP=0", {}, q("key is null"), "ATERROR"},
     Case{"no_value", "AT+QX_CACHE_PROP=1,step", {}, q("value is null"), "ATERROR"},
-    Case{"set_fails", "AT+QX_CACHE_PROP=1,step,42", {mkdir(kInfo)},
-         q("set value failed"), "ATNG"},
+    Case{"set_fails", "AT+QX_CACHE_PROP=1,step,42", {mkdir(kInfo)}, kSetFail, "ATNG"},
     Case{"check_fails", "AT+QX_CACHE_PROP=1,step,4 ", {}, q("check value failed"), "ATNG"},  // the store trims
-    Case{"delete", "AT+QX_CACHE_PROP=2,step", {file(kInfo, "keepscreen=1\nstep=42\n")}, "", "ATOK",
-         {file_is(kInfo, "keepscreen=1\n")}},
+    Case{"delete", "AT+QX_CACHE_PROP=2,step", {file(kInfo, kKs + "step=42\n")}, "", "ATOK",
+         {file_is(kInfo, kKs)}},
     Case{"delete_none", "AT+QX_CACHE_PROP=2,step", {}, q("delete step error"), "ATNG"},
     Case{"other", "AT+QX_CACHE_PROP=3,step", {}, q("invalid command"), "ATERROR"},
     // Station text never adds lines or keys to the items file.
-    Case{"set_key_with_line", "AT+QX_CACHE_PROP=1,k\ninjected_key=evil,v", {file(kInfo, "keepscreen=1\n")},
-         q("set value failed"), "ATNG", {file_is(kInfo, "keepscreen=1\n")}},
-    Case{"set_value_with_line", "AT+QX_CACHE_PROP=1,k,v\ninjected_key=evil", {file(kInfo, "keepscreen=1\n")},
-         q("set value failed"), "ATNG", {file_is(kInfo, "keepscreen=1\n")}},
-    Case{"set_value_with_cr", "AT+QX_CACHE_PROP=1,k,v\rinjected_key=evil", {}, q("set value failed"), "ATNG",
-         {file_is(kInfo, "")}},
-    Case{"set_key_with_equals", "AT+QX_CACHE_PROP=1,injected_key=evil,v", {}, q("set value failed"), "ATNG",
-         {file_is(kInfo, "")}},
-    Case{"get_key_with_line", "AT+QX_CACHE_PROP=0,x\nkeepscreen", {file(kInfo, "keepscreen=1\n")},
-         q("get value failed!"), "ATNG"},
-    Case{"delete_key_with_line", "AT+QX_CACHE_PROP=2,x\nkeepscreen", {file(kInfo, "keepscreen=1\n")},
-         q("delete x\nkeepscreen error"), "ATNG", {file_is(kInfo, "keepscreen=1\n")}}), name_of);
+    Case{"set_key_line", "AT+QX_CACHE_PROP=1,k\nx=1,v", {file(kInfo, kKs)}, kSetFail, "ATNG", {file_is(kInfo, kKs)}},
+    Case{"set_value_line", "AT+QX_CACHE_PROP=1,k,v\nx=1", {file(kInfo, kKs)}, kSetFail, "ATNG", {file_is(kInfo, kKs)}},
+    Case{"set_value_cr", "AT+QX_CACHE_PROP=1,k,v\rx=1", {}, kSetFail, "ATNG", {file_is(kInfo, "")}},
+    Case{"set_key_equals", "AT+QX_CACHE_PROP=1,x=1,v", {}, kSetFail, "ATNG", {file_is(kInfo, "")}},
+    Case{"get_key_line", "AT+QX_CACHE_PROP=0,x\nkeepscreen", {file(kInfo, kKs)}, q("get value failed!"), "ATNG"},
+    Case{"delete_key_line", "AT+QX_CACHE_PROP=2,x\nkeepscreen", {file(kInfo, kKs)}, q("delete x\nkeepscreen error"),
+         "ATNG", {file_is(kInfo, kKs)}}), name_of);
 // clang-format on
 
 // The chip part from the mpps line: "cpu" and the first part in the list's order ("": ERROR).
