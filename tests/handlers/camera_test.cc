@@ -104,6 +104,7 @@ INSTANTIATE_TEST_SUITE_P(BasicOps, CameraLine, ::testing::Values(
     Case{"", "AT+MMICCM=BPERI,2", nullptr, "", "OK", {"camera eng_AT_camera#rear#peri#capture#NULL#NULL -> "}},
     Case{"CameraFails", "AT+MMICCM=FS,2", all_fail, "fail#busy", "ATNG", {"camera capture -> fail#busy"}},
     Case{"", "AT+MMICCM=FB,0", nullptr, "", "OK", {"camera stop -> success"}, {"sensor"}},
+    Case{"CameraFails", "AT+MMICCM=B,0", all_fail, "fail#busy", "ATNG"},
     Case{"ProximityLedOpened", "AT+MMICCM=B,0", proximity, "", "OK", {"sensor test 842 -> 0", "camera stop"}, {"841"}}),
     by_tag);
 
