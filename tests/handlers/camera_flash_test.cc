@@ -3,17 +3,13 @@
 #include <chrono>
 #include <filesystem>
 #include <functional>
-#include <string>
 #include <thread>
-#include <vector>
 
 #include "tests/support/checks.h"
 #include "tests/support/in_process.h"
 #include "tests/support/test_name.h"
 
 namespace {
-
-using Clock = std::chrono::steady_clock;
 
 const char *kLed1 = "/sys/ext_led/EXT_REAR_FLASH_LED1";
 const char *kLed = "/sys/ext_led/EXT_REAR_FLASH_LED";
@@ -25,7 +21,8 @@ const std::string kAtModeNotice = "\r\n\"AT mode not support\"\r\n";
 
 using Setup = std::function<void(const Sandbox &)>;
 Setup gone(const char *node) { return [=](const Sandbox &b) { std::filesystem::remove(b.path(node)); }; }
-Setup ir_msg(const std::string &text) { return [=](const Sandbox &b) { b.write(kIrMsg, text); }; }
+Setup put(const char *path, const std::string &text) { return [=](const Sandbox &b) { b.write(path, text); }; }
+Setup ir_msg(const std::string &text) { return put(kIrMsg, text); }
 Setup fault(const char *name) { return [=](const Sandbox &b) { b.fault(name); }; }
 Setup both(Setup a, Setup b) { return [=](const Sandbox &s) { a(s), b(s); }; }
 const Setup kOldBoard = [](const Sandbox &b) {  // the rear main flash under its older name only
@@ -46,6 +43,7 @@ struct Case {
     const char *word;
     std::vector<std::pair<const char *, const char *>> nodes = {};  // node, text (kGone: missing)
     std::vector<std::string> events = {};                           // recorded in this order
+    int delay_ms = -1;  // a pulse: its two flash records, the timer's 0 this long after the line's write
 };
 void PrintTo(const Case &c, std::ostream *os) { *os << c.line << " " << c.tag; }
 
@@ -62,17 +60,8 @@ protected:
         return out;
     }
     std::vector<Event> wait_flashes(size_t count, int limit_ms) const {  // bounded
-        const auto since = Clock::now();
-        std::vector<Event> got = flashes();
-        while (got.size() < count && Clock::now() - since < std::chrono::milliseconds(limit_ms)) {
-            std::this_thread::sleep_for(std::chrono::milliseconds(5));
-            got = flashes();
-        }
-        return got;
-    }
-    void expect_answer(const std::string &line, const std::string &body, const std::string &word) {
-        const std::string want = frame(line, body, word);
-        EXPECT_EQ(serve(line, SRC_TCP, want.size()), want);
+        wait_until([&] { return flashes().size() >= count; }, limit_ms);
+        return flashes();
     }
 };
 class FlashLine : public FlashTest, public ::testing::WithParamInterface<Case> {};
@@ -80,15 +69,29 @@ class FlashLine : public FlashTest, public ::testing::WithParamInterface<Case> {
 TEST_P(FlashLine, Answers) {
     const Case &c = GetParam();
     if (c.setup) c.setup(box);
-    expect_answer(c.line, c.body, c.word);
+    const std::string want = frame(c.line, c.body, c.word);
+    EXPECT_EQ(serve(c.line, SRC_TCP, want.size()), want);
     for (auto [node, text] : c.nodes) {
         if (text == kGone) EXPECT_FALSE(box.exists(node)) << node;
         else EXPECT_EQ(box.read(node), text) << node;
+    }
+    if (c.delay_ms >= 0) {
+        std::vector<Event> f = wait_flashes(2, c.delay_ms + 3000);
+        ASSERT_EQ(f.size(), 2u) << box.events();
+        for (size_t i : {0, 1}) EXPECT_EQ("flash " + f[i].detail, c.events[i]);
+        EXPECT_GE(f[1].ms - f[0].ms, c.delay_ms - 1);  // the times are whole milliseconds
+        EXPECT_LT(f[1].ms - f[0].ms, c.delay_ms + 1000);
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        EXPECT_EQ(flashes().size(), 2u) << "one write of 0, and nothing after it";
     }
     expect_in_order(box.events(), c.events);
 }
 
 const auto by_tag = named_by([](const Case &c) { return c.line + "," + c.tag; });
+using Flashes = std::vector<std::string>;
+const Flashes kRearPulse{"flash EXT_REAR_FLASH_LED1 900", "flash EXT_REAR_FLASH_LED1 0"};
+const Flashes kSecondPulse{"flash EXT_REAR_FLASH_LED2 900", "flash EXT_REAR_FLASH_LED2 0"};
+const Flashes kFrontTorch{"flash EXT_FRONT_FLASH_LED 75", kRearPulse[1]};
 
 // clang-format off
 // Torches: each form lights or clears its own node only; the rear main flash's two names.
@@ -104,7 +107,6 @@ INSTANTIATE_TEST_SUITE_P(Torch, FlashLine, ::testing::Values(
     Case{"", "AT+QXSG=1,3", nullptr, "", "OK", {{kFront, "75"}, {kLed1, "0\n"}}},
     Case{"", "AT+QXSG=0,3", kLit, "", "OK", {{kFront, "0"}}},
     Case{"NoFrontFlash", "AT+QXSG=1,3", gone(kFront), "", "ERROR"},
-    Case{"", "AT+QXSG=3", kLit, "", "ERROR", {{kLed1, "75"}, {kLed2, "75"}, {kFront, "75"}}},
     Case{"", "AT+QXSG=1,1,1", nullptr, "", "ERROR", {{kLed1, "0\n"}}},
     Case{"", "AT+QXBGD=1", nullptr, "", "OK", {{kFront, "75"}}},
     Case{"", "AT+QXBGD=0", kLit, "", "OK", {{kFront, "0"}, {kLed1, "75"}}},
@@ -115,19 +117,16 @@ INSTANTIATE_TEST_SUITE_P(Torch, FlashLine, ::testing::Values(
 INSTANTIATE_TEST_SUITE_P(PulseOff, FlashLine, ::testing::Values(
     Case{"", "AT+FLAMP=0,0", kLit, "", "OK", {{kFront, "0"}, {kLed1, "75"}}},
     Case{"NoFrontFlash", "AT+FLAMP=0,0", gone(kFront), "", "OK"},
-    Case{"", "AT+FLAMP=1,0", kLit, "", "OK", {{kLed1, "0"}, {kLed, kGone}, {kFront, "75"}}},
-    Case{"BothNames", "AT+FLAMP=1,0", both(kLit, kBothNames), "", "OK", {{kLed1, "0"}, {kLed, "0"}},
+    Case{"BothNames", "AT+FLAMP=1,0", both(kLit, kBothNames), "", "OK", {{kLed1, "0"}, {kLed, "0"}, {kFront, "75"}},
          {"flash EXT_REAR_FLASH_LED1 0", "flash EXT_REAR_FLASH_LED 0"}},
     Case{"", "AT+FLAMP=2,0", both(kLit, kBothNames), "", "OK", {{kLed2, "0"}, {kLed, "0"}, {kLed1, "75"}},
          {"flash EXT_REAR_FLASH_LED2 0", "flash EXT_REAR_FLASH_LED 0"}},
     Case{"NoRearFlash", "AT+FLAMP=1,1", gone(kLed1), "", "ERROR", {{kLed, kGone}}},
     Case{"NoSecondFlash", "AT+FLAMP=2,1", gone(kLed2), "", "ATNG"},
-    Case{"", "AT+FLAMP=3,1", nullptr, "", "ERROR"},
     Case{"", "AT+FLAMP=0,0,5", kLit, "", "ERROR", {{kFront, "75"}}},
     Case{"", "AT+QXFLIGHT=1", nullptr, "", "OK", {}, {"camera flash_mode#on -> success"}},
     Case{"", "AT+QXFLIGHT=2", nullptr, "", "OK", {}, {"camera flash_mode#auto -> success"}},
-    Case{"CameraFails", "AT+QXFLIGHT=1",
-         [](const Sandbox &b) { b.write("/.sim/camera.replies", "flash_mode#on => fail#no flash\n"); },
+    Case{"CameraFails", "AT+QXFLIGHT=1", put("/.sim/camera.replies", "flash_mode#on => fail#no flash\n"),
          "fail#no flash", "ERROR", {}, {"camera flash_mode#on -> fail#no flash"}},
     Case{"CameraDown", "AT+QXFLIGHT=2", fault("camera"), "fail#camera service not available", "ERROR"},
     Case{"", "AT+QXFLIGHT=3", nullptr, "", "ERROR"}), by_tag);
@@ -146,66 +145,30 @@ INSTANTIATE_TEST_SUITE_P(Infrared, FlashLine, ::testing::Values(
     Case{"NoMessageFile", "AT+QX_FLED_INF=2", nullptr, "\r\n\"access msg failed\"\r\n", "ATERROR"},
     Case{"AtMode", "AT+QX_FLED_INF=2", both(kAtMode, ir_msg("ok")), kAtModeNotice, "ATERROR"},
     Case{"", "AT+QX_FLED_INF=3,0", kLit, "", "ATOK", {{kFront, "0"}, {kLed1, "75"}}},
-    Case{"", "AT+QX_FLED_INF=3", nullptr, "", "ERROR"},
-    Case{"", "AT+QX_FLED_INF=4", nullptr, "", "ERROR"}), by_tag);
+    Case{"", "AT+QX_FLED_INF=3", nullptr, "", "ERROR"}), by_tag);
+
+// Pulses: the line's write, and the timer's single write of 0 after its delay (default, capped).
+INSTANTIATE_TEST_SUITE_P(Timers, FlashLine, ::testing::Values(
+    Case{"RearDefault", "AT+FLAMP=1,1", nullptr, "", "OK", {}, kRearPulse, 500},
+    Case{"RearGiven", "AT+FLAMP=1,1,100", nullptr, "", "OK", {}, kRearPulse, 100},
+    Case{"RearHugeCapped", "AT+FLAMP=1,1,99999999999", nullptr, "", "OK", {}, kRearPulse, 500},
+    Case{"RearNegativeClosesAtOnce", "AT+FLAMP=1,1,-40", nullptr, "", "OK", {}, kRearPulse, 0},
+    Case{"RearOlderNode", "AT+FLAMP=1,1,150", kOldBoard, "", "OK", {{kLed1, kGone}},
+         {"flash EXT_REAR_FLASH_LED 900", "flash EXT_REAR_FLASH_LED 0"}, 150},
+    Case{"SecondDefault", "AT+FLAMP=2,1", nullptr, "", "ATOK", {}, kSecondPulse, 500},
+    Case{"SecondCapped", "AT+FLAMP=2,1,2000", nullptr, "", "ATOK", {}, kSecondPulse, 500},
+    // The front torch stays on; its timer closes the rear main flash.
+    Case{"FrontTorchDefault", "AT+FLAMP=0,1", nullptr, "", "OK", {}, kFrontTorch, 200},
+    Case{"FrontTorchCapped", "AT+FLAMP=0,1,20000", nullptr, "", "OK", {}, kFrontTorch, 10000},
+    Case{"InfraredThreeSeconds", "AT+QX_FLED_INF=3,1", nullptr, "", "ATOK", {},
+         {"flash EXT_FRONT_FLASH_LED 75", "flash EXT_FRONT_FLASH_LED 0"}, 3000}), by_tag);
 // clang-format on
 
-// A pulse: the write that lights it, and the timer's single write of 0 after its delay.
-struct Pulse {
-    const char *name, *line;
-    const char *on, *off;  // the flash driver's records of the line's write and the timer's
-    int delay_ms;
-    const char *word;
-};
-void PrintTo(const Pulse &p, std::ostream *os) { *os << p.line; }
-class FlashPulse : public FlashTest, public ::testing::WithParamInterface<Pulse> {};
-
-TEST_P(FlashPulse, ClosesAfterItsDelay) {
-    const Pulse &p = GetParam();
-    expect_answer(p.line, "", p.word);
-    std::vector<Event> f = wait_flashes(2, p.delay_ms + 3000);
-    ASSERT_EQ(f.size(), 2u) << box.events();
-    EXPECT_EQ(f[0].detail, p.on);
-    EXPECT_EQ(f[1].detail, p.off);
-    EXPECT_GE(f[1].ms - f[0].ms, p.delay_ms - 1);  // the times are whole milliseconds
-    EXPECT_LT(f[1].ms - f[0].ms, p.delay_ms + 1000);
-    std::this_thread::sleep_for(std::chrono::milliseconds(50));
-    EXPECT_EQ(flashes().size(), 2u) << "one write of 0, and nothing after it";
-}
-
-const char *kRearOn = "EXT_REAR_FLASH_LED1 900", *kRearOff = "EXT_REAR_FLASH_LED1 0";
-INSTANTIATE_TEST_SUITE_P(Timers, FlashPulse, ::testing::Values(
-    Pulse{"RearDefault", "AT+FLAMP=1,1", kRearOn, kRearOff, 500, "OK"},
-    Pulse{"RearGiven", "AT+FLAMP=1,1,100", kRearOn, kRearOff, 100, "OK"},
-    Pulse{"RearCapped", "AT+FLAMP=1,1,2000", kRearOn, kRearOff, 500, "OK"},
-    Pulse{"RearHugeCapped", "AT+FLAMP=1,1,99999999999", kRearOn, kRearOff, 500, "OK"},
-    Pulse{"RearNegativeClosesAtOnce", "AT+FLAMP=1,1,-40", kRearOn, kRearOff, 0, "OK"},
-    Pulse{"SecondDefault", "AT+FLAMP=2,1", "EXT_REAR_FLASH_LED2 900", "EXT_REAR_FLASH_LED2 0", 500, "ATOK"},
-    Pulse{"SecondCapped", "AT+FLAMP=2,1,2000", "EXT_REAR_FLASH_LED2 900", "EXT_REAR_FLASH_LED2 0", 500, "ATOK"},
-    // The front torch stays on; its timer closes the rear main flash.
-    Pulse{"FrontTorchDefault", "AT+FLAMP=0,1", "EXT_FRONT_FLASH_LED 75", kRearOff, 200, "OK"},
-    Pulse{"FrontTorchCapped", "AT+FLAMP=0,1,20000", "EXT_FRONT_FLASH_LED 75", kRearOff, 10000, "OK"},
-    Pulse{"InfraredThreeSeconds", "AT+QX_FLED_INF=3,1", "EXT_FRONT_FLASH_LED 75", "EXT_FRONT_FLASH_LED 0", 3000, "ATOK"}),
-    [](const ::testing::TestParamInfo<Pulse> &info) { return std::string(info.param.name); });
-
-TEST_F(FlashTest, RearTimerClosesTheOlderNodeToo) {
-    kOldBoard(box);
-    expect_answer("AT+FLAMP=1,1,150", "", "OK");
-    std::vector<Event> f = wait_flashes(2, 3000);
-    ASSERT_EQ(f.size(), 2u) << box.events();
-    EXPECT_EQ(f[0].detail, "EXT_REAR_FLASH_LED 900");
-    EXPECT_EQ(f[1].detail, "EXT_REAR_FLASH_LED 0");
-    EXPECT_GE(f[1].ms - f[0].ms, 149);
-    EXPECT_FALSE(box.exists(kLed1));
-}
-
 TEST_F(FlashTest, OverlappingTimersEachCloseAtTheirOwnTime) {
-    expect_answer("AT+FLAMP=1,1,400", "", "OK");
-    expect_answer("AT+FLAMP=1,1,100", "", "OK");
+    for (const char *line : {"AT+FLAMP=1,1,400", "AT+FLAMP=1,1,100"}) EXPECT_EQ(serve(line), frame(line, "", "OK"));
     std::vector<Event> f = wait_flashes(4, 3000);
     ASSERT_EQ(f.size(), 4u) << box.events();
-    for (size_t i : {0, 1}) EXPECT_EQ(f[i].detail, kRearOn);
-    for (size_t i : {2, 3}) EXPECT_EQ(f[i].detail, kRearOff);
+    for (size_t i : {0, 1, 2, 3}) EXPECT_EQ("flash " + f[i].detail, kRearPulse[i / 2]);
     EXPECT_GE(f[2].ms - f[1].ms, 99);   // the later, shorter pulse closes first
     EXPECT_GE(f[3].ms - f[0].ms, 399);  // and the first timer still writes 0 at its time
     EXPECT_LT(f[2].ms, f[3].ms);

@@ -1,6 +1,5 @@
-// Camera tests: exact frames, the camera messages and test-app messages in order, the
-// marker files, and the answers of a gated project, a silent or failing camera service
-// and missing nodes.
+// Camera tests: exact frames, camera and test-app messages in order, marker files, and the
+// answers of a gated project, a silent or failing camera service and missing nodes.
 #include <filesystem>
 #include <functional>
 #include <string>
@@ -19,11 +18,7 @@ const char *kRefocus = "/data/engineermode/refocus_check";
 const char *kFrontRefocus = "/data/engineermode/front_refocus_check";
 const std::string kFocus = "eng_AT_camera#NULL#NULL#focus_control#distance ";
 const std::string kBackStart = "camera start#cameraId back#eng_AT_command true -> success";
-const std::string kManyParams = [] {
-    std::string s;
-    for (int i = 0; i < 600; ++i) s += ",77";
-    return s;
-}();
+const std::string kManyParams = "," + std::string(1800, '7');
 const std::string kGetResult = "eng_AT_camera#rear#main#auto_test_get_result#params 0";
 
 std::string nv_pattern() { return nv_fill(0x21, 91); }  // every byte non-zero, so a stray write shows
@@ -49,6 +44,12 @@ const Setup all_fail = put("/.sim/camera.replies", "* => fail#busy\n");
 const Setup markers = [](const Sandbox &b) {
     for (const char *m : {kPdaf, kRefocus, kFrontRefocus}) b.write(m, "");
 };
+const Setup otp_fails = [](const Sandbox &b) { b.set_prop("sys.camera.rear_camera_wide_otp_status", "0"); };
+Setup pdaf_reply(const std::string &reply) { return says("eng_AT_camera#qx_ccm_pdaf#1#rear", reply); }
+std::string touch(const char *marker) { return "touch " + std::string(marker); }
+const Setup rgb = [](const Sandbox &b) { b.set_prop("persist.camera.is_rgb", "1"); };
+const Setup uart = [](const Sandbox &) { is_uart_flag = 1; };
+const std::string kPdafLine = "AT+QX_CCM_PDAF=1,rear", kSelf = "camera eng_AT_camera#rear#main#auto_test_";
 Setup fault(const char *name) { return [=](const Sandbox &b) { b.fault(name); }; }
 
 struct Case {
@@ -90,25 +91,22 @@ TEST_P(CameraLine, Answers) {
 }
 
 // clang-format off
-// Opening each camera: its message, the proximity LED step of some projects, failures.
-INSTANTIATE_TEST_SUITE_P(Open, CameraLine, ::testing::Values(
+// Open, capture and stop: each camera's message, the proximity LED closed and opened again on some projects.
+INSTANTIATE_TEST_SUITE_P(BasicOps, CameraLine, ::testing::Values(
     Case{"", "AT+MMICCM=B,1", nullptr, "", "OK", {kBackStart}, {"sensor"}},
     Case{"", "AT+MMICCM=bmacro,1", nullptr, "", "OK", {"camera eng_AT_camera#rear#macro#open#NULL#NULL -> "}},
     Case{"ProximityLedClosed", "AT+MMICCM=B,1", proximity, "", "OK", {"sensor test 841 -> 0", kBackStart}, {"842"}},
     Case{"SensorMismatch", "AT+MMICCM=B,1", mismatch, "\"sensor material mismatch\"", "ERROR", {"sensor test 841 -> -1"},
          {"camera"}},
     Case{"CameraFails", "AT+MMICCM=B,1", all_fail, "fail#busy", "ERROR", {"camera start#"}},
-    Case{"NotGated", "AT+MMICCM=B,1", gated, "", "OK", {kBackStart}}), by_tag);
-
-// Capture, focus and stop, with the proximity LED opened again on stop.
-INSTANTIATE_TEST_SUITE_P(CaptureFocusStop, CameraLine, ::testing::Values(
+    Case{"NotGated", "AT+MMICCM=B,1", gated, "", "OK", {kBackStart}},
     Case{"", "AT+MMICCM=B,2", nullptr, "", "OK", {"camera capture -> success"}},
     Case{"", "AT+MMICCM=BPERI,2", nullptr, "", "OK", {"camera eng_AT_camera#rear#peri#capture#NULL#NULL -> "}},
     Case{"CameraFails", "AT+MMICCM=FS,2", all_fail, "fail#busy", "ATNG", {"camera capture -> fail#busy"}},
     Case{"", "AT+MMICCM=FB,0", nullptr, "", "OK", {"camera stop -> success"}, {"sensor"}},
-    Case{"ProximityLedOpened", "AT+MMICCM=B,0", proximity, "", "OK", {"sensor test 842 -> 0", "camera stop"}, {"841"}},
-    Case{"SensorMismatch", "AT+MMICCM=B,0", mismatch, "\"sensor material mismatch\"", "ERROR", {}, {"camera"}},
-    Case{"CameraFails", "AT+MMICCM=B,0", all_fail, "fail#busy", "ATNG"}), by_tag);
+    Case{"CameraFails", "AT+MMICCM=B,0", all_fail, "fail#busy", "ATNG"},
+    Case{"ProximityLedOpened", "AT+MMICCM=B,0", proximity, "", "OK", {"sensor test 842 -> 0", "camera stop"}, {"841"}}),
+    by_tag);
 
 // Forms only ungated projects have (above 6290 or TD above 6203): OIS, PDAF and refocus
 // markers, long shots, free text.
@@ -119,8 +117,7 @@ INSTANTIATE_TEST_SUITE_P(GatedForms, CameraLine, ::testing::Values(
     Case{"Gated", "AT+MMICCM=B,4", gated, kGate, "ATERROR", {}, {"camera"}},
     Case{"GatedByTd", "AT+MMICCM=BB,4", td_gated, kGate, "ATERROR", {}, {"camera"}},
     Case{"AtTheGate", "AT+MMICCM=B,4", at_gate, "", "OK", {"camera ois"}},
-    Case{"", "AT+MMICCM=B,6", nullptr, "", "OK",
-         {"camera pdaf_test -> success",
+    Case{"", "AT+MMICCM=B,6", nullptr, "", "OK", {"camera pdaf_test -> success",
          "shell /system/bin/sh -c \"touch /data/engineermode/pdaf_test\""}, {}, {{kPdaf, true}}},
     Case{"UpperCaseSuccess", "AT+MMICCM=BB,6", says("pdaf_test", "SUCCESS"), "", "OK", {}, {}, {{kPdaf, true}}},
     Case{"WholeReplyOnly", "AT+MMICCM=B,6", both(markers, says("pdaf_test", "success#partly")), "", "ATNG", {}, {"touch"},
@@ -129,14 +126,11 @@ INSTANTIATE_TEST_SUITE_P(GatedForms, CameraLine, ::testing::Values(
     Case{"NoMarker", "AT+MMICCM=BB,7", nullptr, "", "ATNG", {}, {"camera"}},
     Case{"", "AT+MMICCM=BTELE,7", nullptr, "", "OK", {"camera eng_AT_camera#rear#tele#pdaf_test#NULL#NULL -> "}},
     Case{"", "AT+MMICCM=BMACRO,7", nullptr, "", "ATERROR", {}, {"camera"}},
-    Case{"", "AT+MMICCM=B,8", nullptr, "", "OK",
-         {"camera refocus_check -> success", "touch /data/engineermode/refocus_check"}, {}, {{kRefocus, true},
-         {kFrontRefocus, false}}},
-    Case{"", "AT+MMICCM=FB,8", nullptr, "", "OK",
-         {"camera front_refocus_check -> ", "touch " + std::string(kFrontRefocus)}, {}, {{kFrontRefocus, true},
-         {kRefocus, false}}},
+    Case{"", "AT+MMICCM=B,8", nullptr, "", "OK", {"camera refocus_check -> success", touch(kRefocus)}, {},
+         {{kRefocus, true}, {kFrontRefocus, false}}},
+    Case{"", "AT+MMICCM=FB,8", nullptr, "", "OK", {"camera front_refocus_check -> ", touch(kFrontRefocus)}, {},
+         {{kFrontRefocus, true}, {kRefocus, false}}},
     Case{"Fails", "AT+MMICCM=F,8", both(markers, all_fail), "", "ERROR", {}, {}, {{kFrontRefocus, false}, {kRefocus, true}}},
-    Case{"", "AT+MMICCM=B,9", markers, "", "OK"},
     Case{"OnlyRearMarker", "AT+MMICCM=F,9", put(kRefocus, ""), "", "ERROR"},
     Case{"", "AT+MMICCM=BB,10", nullptr, "", "OK", {"camera long_shot#value start# -> success"}},
     Case{"", "AT+MMICCM=BB,10,25", nullptr, "", "OK", {"camera long_shot#value start#number 25 -> "}},
@@ -154,8 +148,8 @@ INSTANTIATE_TEST_SUITE_P(GatedForms, CameraLine, ::testing::Values(
          {"camera " + std::string(199, 'm') + " -> success"}},
     Case{"Gated", "AT+MMICCM=BS,test,x", gated, kGate, "ATERROR", {}, {"camera"}}), by_tag);
 
-// The front light leak judged against -999..1000, and lines no form takes.
-INSTANTIATE_TEST_SUITE_P(LightLeakAndInvalid, CameraLine, ::testing::Values(
+// The front light leak judged against -999..1000, lines no form takes, and the camera's self-test.
+INSTANTIATE_TEST_SUITE_P(LightLeakAndSelfTest, CameraLine, ::testing::Values(
     Case{"", "AT+MMICCM=F,11", nullptr, "\r\n\"+Light:12.5\"\r\n", "ATOK", {"camera front_light_leak -> "}},
     Case{"AboveLimit", "AT+MMICCM=F,11", leak("1000.5"), "\r\n\"+Light:1000.5\"\r\n", "ATNG"},
     Case{"AtLowerLimit", "AT+MMICCM=F,11", leak("-999"), "\r\n\"+Light:-999\"\r\n", "ATOK"},
@@ -163,35 +157,27 @@ INSTANTIATE_TEST_SUITE_P(LightLeakAndInvalid, CameraLine, ::testing::Values(
     Case{"NotANumber", "AT+MMICCM=F,11", leak("dark"), "\r\n\"+Light:dark\"\r\n", "ATNG"},
     Case{"NoValue", "AT+MMICCM=F,11", says("front_light_leak", "success"), "\r\n\"+Light:\"\r\n", "ATNG"},
     Case{"CameraFails", "AT+MMICCM=F,11", all_fail, "", "ATERROR", {"camera front_light_leak -> fail#busy"}},
-    Case{"NotGated", "AT+MMICCM=F,11", gated, "\r\n\"+Light:12.5\"\r\n", "ATOK"},
     Case{"", "AT+MMICCM=f,11", nullptr, "", "ERROR", {}, {"camera"}},
     Case{"", "AT+MMICCM=B,1,1", nullptr, "", "ERROR", {}, {"camera"}},
-    Case{"", "AT+MMICCM=BMACRO,4", nullptr, "", "ERROR", {}, {"camera"}}), by_tag);
-
-// The self-test's execute, set and result forms.
-INSTANTIATE_TEST_SUITE_P(SelfTest, CameraLine, ::testing::Values(
-    Case{"", "AT+QX_CCM_SLTS=1,rear,main,1,2", nullptr, "", "ATOK",
-         {"camera eng_AT_camera#rear#main#auto_test_execute#params 1,2 -> success"}},
+    // The self-test's execute, set and result forms.
+    Case{"", "AT+QX_CCM_SLTS=1,rear,main,1,2", nullptr, "", "ATOK", {kSelf + "execute#params 1,2 -> success"}},
     Case{"", "AT+QX_CCM_SLTS=2,front,wide,7", nullptr, "", "ATOK",
          {"camera eng_AT_camera#front#wide#auto_test_set_param#params 7 -> "}},
-    Case{"", "AT+QX_CCM_SLTS=1 rear#main,,3 4", nullptr, "", "ATOK",
-         {"camera eng_AT_camera#rear#main#auto_test_execute#params 3,4 -> "}},
+    Case{"", "AT+QX_CCM_SLTS=1 rear#main,,3 4", nullptr, "", "ATOK", {kSelf + "execute#params 3,4 -> "}},
     Case{"", "AT+QX_CCM_SLTS=3,rear,main,0", nullptr, "\r\n\"+af:1\"\r\n\r\n\"+ae:0\"\r\n", "ATOK",
-         {"camera eng_AT_camera#rear#main#auto_test_get_result#params 0 -> success#auto_test_get_result#af 1#ae 0"}},
+         {kSelf + "get_result#params 0 -> success#auto_test_get_result#af 1#ae 0"}},
     Case{"NoResults", "AT+QX_CCM_SLTS=3,rear,main,0", says(kGetResult, "success#x"), "", "ATOK"},
     Case{"KeyWithoutValue", "AT+QX_CCM_SLTS=3,rear,main,0", says(kGetResult, "success#x#flag#k v w"),
          "\r\n\"+flag:\"\r\n\r\n\"+k:v w\"\r\n", "ATOK"},
     Case{"CameraFails", "AT+QX_CCM_SLTS=3,rear,main,0", all_fail, "fail#busy", "ERROR"},
-    Case{"NotGated", "AT+QX_CCM_SLTS=1,rear,main,1", gated, "", "ATOK"},
     // The message is cut where its 1024-byte buffer ends.
     Case{"", "AT+QX_CCM_SLTS=2,rear,main,0" + kManyParams, nullptr, "", "ATOK",
-         {"camera eng_AT_camera#rear#main#auto_test_set_param#params 0" + kManyParams.substr(0, 1023 - 52) + " -> "}},
-    Case{"", "AT+QX_CCM_SLTS=1", nullptr, "", "ERROR", {}, {"camera"}},
+         {kSelf + "set_param#params 0" + kManyParams.substr(0, 1023 - 52) + " -> "}},
     Case{"", "AT+QX_CCM_SLTS=1,rear,main", nullptr, "", "ERROR", {}, {"camera"}},
     Case{"", "AT+QX_CCM_SLTS=4,rear,main,1", nullptr, "", "ERROR", {}, {"camera"}}), by_tag);
 
-// The test mode and the screen fill light.
-INSTANTIATE_TEST_SUITE_P(ModeAndFillLight, CameraLine, ::testing::Values(
+// The test mode, the screen fill light and the connection checks.
+INSTANTIATE_TEST_SUITE_P(ModeLightAndConnection, CameraLine, ::testing::Values(
     Case{"", "AT+QX_CCM_CVT=1", nullptr, "", "OK", {}, {"camera"}},
     Case{"", "AT+QX_CCM_CVT=2", nullptr, "", "ERROR"},
     Case{"Gated", "AT+QX_CCM_CVT=1", gated, kGate, "ATERROR"},
@@ -206,40 +192,32 @@ INSTANTIATE_TEST_SUITE_P(ModeAndFillLight, CameraLine, ::testing::Values(
     Case{"", "AT+LCML=1", nullptr, "", "OK", {"camera screen_front_flash#value on -> success"}},
     Case{"NotGated", "AT+LCML=2", gated, "", "OK", {"camera screen_front_flash#value capture -> success"}},
     Case{"CameraDown", "AT+LCML=2", fault("camera"), "fail#camera service not available", "ERROR"},
-    Case{"", "AT+LCML=3", nullptr, "", "ERROR", {}, {"camera"}}), by_tag);
-
-// Whether the cameras are connected: the test app's count and the camera tool's flags.
-INSTANTIATE_TEST_SUITE_P(Connection, CameraLine, ::testing::Values(
+    Case{"", "AT+LCML=3", nullptr, "", "ERROR", {}, {"camera"}},
+    // Whether the cameras are connected: the test app's count and the camera tool's flags.
     Case{"", "AT+QXCCM=1", [](const Sandbox &b) { b.reply("CameraConnect", "3"); }, "", "OK",
          {"message CameraConnect -> 3"}},
     Case{"NotConnected", "AT+QXCCM=1", nullptr, "", "ERROR", {"message CameraConnect -> ok"}},
     Case{"TestAppSilent", "AT+QXCCM=1", fault("testapp-silent"), "", "ERROR"},
     Case{"Gated", "AT+QXCCM=1", gated, kGate, "ATERROR", {}, {"message"}},
-    Case{"", "AT+QXCCM=2", nullptr, "", "ERROR", {}, {"message"}},
     Case{"ToolSilent", "AT+QX_CCM_CONN=1", nullptr, "\"0,0,0,0\"", "ATOK", {"shell ftcmd_camera"}},
     Case{"", "AT+QX_CCM_CONN=1", put("/.sim/shell.replies", "ftcmd_camera => 2,1,0,1\n"), "\"2,1,0,1\"", "ATOK"},
     Case{"NotConnected", "AT+QX_CCM_CONN=1", put("/.sim/shell.replies", "ftcmd_camera => 3,1,1,1\n"), "\"3,1,1,1\"", "ATNG"},
-    Case{"ToolFails", "AT+QX_CCM_CONN=1", fault("ext-system"), "\"0,0,0,0\"", "ATOK"},
     Case{"Gated", "AT+QX_CCM_CONN=1", gated, kGate, "ATERROR", {}, {"shell"}},
     Case{"", "AT+QX_CCM_CONN=0", nullptr, "", "ERROR", {}, {"shell"}}), by_tag);
 
-// Sensor names, serial numbers, the infrared module and the colour type.
+// Sensor names, serial numbers, the infrared module, the colour type and the OTP status.
 INSTANTIATE_TEST_SUITE_P(Identity, CameraLine, ::testing::Values(
     Case{"", "AT+QXCCMID=0", nullptr, "\r\n\"front:s5k3p9sp\n\r\nback:imx586\n\"\r\n ", "OK"},
     Case{"OneLineOnly", "AT+QXCCMID=0", put("/sys/ccm/FrontSensorId", "ov16a1q\nsecond line\n"),
          "\r\n\"front:ov16a1q\n\r\nback:imx586\n\"\r\n ", "OK"},
-    Case{"RearNodeMissing", "AT+QXCCMID=0", gone("/sys/ccm/RearSensorId"), "", "ERROR"},
     Case{"FrontNodeMissing", "AT+QXCCMID=0", gone("/sys/ccm/FrontSensorId"), "", "ERROR"},
     Case{"Gated", "AT+QXCCMID=0", gated, kGate, "ATERROR"},
     Case{"", "AT+QXCCMID=1", nullptr, "", "ERROR"},
-    Case{"", "AT+QX_CCM_SN=1,F,MAIN", nullptr, "\r\n\"FM5012A0131\"\r\n", "ATOK"},
     Case{"", "AT+QX_CCM_SN=1,r,macro", nullptr, "\r\n\"RC5012D0019\"\r\n", "ATOK"},
     Case{"", "AT+QX_CCM_SN=1,R,PORT", config("camera_sn.rear_camera_port", "RP77"), "\r\n\"RP77\"\r\n", "ATOK"},
     Case{"NotFitted", "AT+QX_CCM_SN=1,R,TELE", nullptr, "\r\n\"\"\r\n", "ATOK"},
     Case{"", "AT+QX_CCM_SN=1,R,FOO", nullptr, "", "ATERROR"},
-    Case{"", "AT+QX_CCM_SN=0,1", nullptr, "\r\n\"FM5012A0131\"\r\n", "ATOK"},
     Case{"", "AT+QX_CCM_SN=0,3,extra", nullptr, "\r\n\"RM5012B0457\"\r\n", "ATOK"},
-    Case{"", "AT+QX_CCM_SN=0,5", nullptr, "", "ATERROR"},
     Case{"", "AT+QX_CCM_IRID=0", nullptr, "\r\n\"1\"\r\n", "ATOK"},
     Case{"Module2", "AT+QX_CCM_IRID=0", put("/persist/camera/ir_id_sub", "2"), "\r\n\"2\"\r\n", "ATOK"},
     Case{"UnknownModule", "AT+QX_CCM_IRID=0", put("/persist/camera/ir_id_sub", "1\n"), "\r\n\"1\n\"\r\n", "ATNG"},
@@ -247,20 +225,13 @@ INSTANTIATE_TEST_SUITE_P(Identity, CameraLine, ::testing::Values(
          "ATNG"},
     Case{"Gated", "AT+QX_CCM_IRID=0", gated, kGate, "ATERROR"},
     Case{"", "AT+QX_CCM_IRID=1", nullptr, "", "ERROR"},
-    Case{"", "AT+QX_CCM_COLOR=FB,1", nullptr, "\r\n\"2\"\r\n", "ATOK"},
-    Case{"", "AT+QX_CCM_COLOR=BB,1", [](const Sandbox &b) { b.set_prop("persist.camera.is_rgb", "1"); }, "\r\n\"2\"\r\n",
-         "ATOK"},
-    Case{"Rgb", "AT+QX_CCM_COLOR=BS,1", [](const Sandbox &b) { b.set_prop("persist.camera.is_rgb", "1"); },
-         "\r\n\"1\"\r\n", "ATOK"},
+    Case{"", "AT+QX_CCM_COLOR=BB,1", rgb, "\r\n\"2\"\r\n", "ATOK"},
+    Case{"Rgb", "AT+QX_CCM_COLOR=BS,1", rgb, "\r\n\"1\"\r\n", "ATOK"},
     Case{"Mono", "AT+QX_CCM_COLOR=BS,1", nullptr, "\r\n\"2\"\r\n", "ATOK"},
     Case{"Gated", "AT+QX_CCM_COLOR=FS,1", gated, kGate, "ATERROR"},
-    Case{"", "AT+QX_CCM_COLOR=BS,2", gated, "", "ATERROR"}), by_tag);
+    Case{"", "AT+QX_CCM_COLOR=BS,2", gated, "", "ATERROR"},
 
-const Setup otp_fails = [](const Sandbox &b) { b.set_prop("sys.camera.rear_camera_wide_otp_status", "0"); };
-Setup pdaf_reply(const std::string &reply) { return says("eng_AT_camera#qx_ccm_pdaf#1#rear", reply); }
-
-// The newer interface: OTP status from properties, commands translated for the service.
-INSTANTIATE_TEST_SUITE_P(NewerInterface, CameraLine, ::testing::Values(
+    // The newer interface: OTP status from properties, commands translated for the service.
     Case{"", "AT+QX_CCM_OTP=1", nullptr,
          "front_camera_main:pass\r\nrear_camera_main:pass\r\nrear_camera_wide:pass\r\nrear_camera_wide:pass\r\n", "ATOK"},
     // The macro camera is checked with the wide camera's property, so both fail.
@@ -269,58 +240,28 @@ INSTANTIATE_TEST_SUITE_P(NewerInterface, CameraLine, ::testing::Values(
     Case{"OtherCameras", "AT+QX_CCM_OTP=1", config("cameras", "front:RTBOnly,rear:Macro,front:Wide"),
          "front_camera_rtb:pass\r\nfront_camera_wide:pass\r\nrear_camera_wide:pass\r\n", "ATOK"},
     Case{"OldScheme", "AT+QX_CCM_OTP=1", config("camera_new_interface", "0"), "", "ATNG"},
-    Case{"", "AT+QX_CCM_OTP=3", nullptr, "", "ATERROR", {}, {"camera"}},
     Case{"", "AT+QX_CCM_OTP=2", nullptr, "", "ATERROR", {}, {"camera"}},
     Case{"", "AT+QX_CCM_OTP=2,rear", nullptr, "", "ATOK", {"camera eng_AT_camera#qx_ccm_otp#2#rear -> success"},
          {"calibrate"}},
-    Case{"", "AT+QX_CCM_PDAF=1,rear", nullptr, "", "ATOK",
+    Case{"", kPdafLine, nullptr, "", "ATOK",
          {"camera eng_AT_camera#qx_ccm_pdaf#1#rear -> success", "calibrate pdaf_calibration=1 uart=0"}},
-    Case{"Values", "AT+QX_CCM_PDAF=1,rear", pdaf_reply("success#pdaf#shift 0.8#conf 97"),
+    Case{"Values", kPdafLine, pdaf_reply("success#pdaf#shift 0.8#conf 97"),
          "\r\n\"+shift:0.8\"\r\n\r\n\"+conf:97\"\r\n", "ATOK", {"calibrate pdaf_calibration=1"}},
-    Case{"CameraFails", "AT+QX_CCM_PDAF=1,rear", pdaf_reply("fail#no target"), "\"fail#no target\"", "ATNG", {},
-         {"calibrate"}},
-    Case{"UartConsole", "AT+QX_CCM_PDAF=1,rear", [](const Sandbox &) { is_uart_flag = 1; }, "", "ATOK",
-         {"calibrate pdaf_calibration=1 uart=1"}},
-    Case{"ItemNotSaved", "AT+QX_CCM_PDAF=1,rear", fault("calibrate-item"), "save_ret=-5", "ATNG",
+    Case{"CameraFails", kPdafLine, pdaf_reply("fail#no target"), "\"fail#no target\"", "ATNG", {}, {"calibrate"}},
+    Case{"UartConsole", kPdafLine, uart, "", "ATOK", {"calibrate pdaf_calibration=1 uart=1"}},
+    Case{"ItemNotSaved", kPdafLine, fault("calibrate-item"), "save_ret=-5", "ATNG",
          {"calibrate pdaf_calibration=1 uart=0 (failed)"}},
-    Case{"ShortItemName", "AT+QX_CCM_PDAF=1,rear", config("camera_item.AT+QX_CCM_PDAF", "ab"), "", "ATOK", {},
-         {"calibrate"}},
-    Case{"Untranslatable", "AT+QX_CCM_PDAF=1,rear", fault("camera-transform"), "", "ATERROR", {}, {"camera"}},
+    Case{"ShortItemName", kPdafLine, config("camera_item.AT+QX_CCM_PDAF", "ab"), "", "ATOK", {}, {"calibrate"}},
+    Case{"Untranslatable", kPdafLine, fault("camera-transform"), "", "ATERROR", {}, {"camera"}},
     Case{"", "AT+QX_CCM_SINGLE=3,front,main", nullptr, "", "ATOK",
          {"camera eng_AT_camera#qx_ccm_single#3#front#main -> success"}, {"calibrate"}},
     Case{"", "AT+QX_CCM_PARA=2,5", nullptr, "", "ATOK", {"camera eng_AT_camera#qx_ccm_para#2#5 -> "}},
-    Case{"", "AT+QX_CCM_PARA=1,120", nullptr, "", "ATOK", {"camera eng_AT_camera#NULL#NULL#focus_control#distance 120 -> "}},
-    Case{"CameraFails", "AT+QX_CCM_PARA=1,120", all_fail, "", "ATOK",
-         {"camera eng_AT_camera#NULL#NULL#focus_control#distance 120 -> fail"}},
-    Case{"NoDistance", "AT+QX_CCM_PARA=1,", nullptr, "", "ATOK",
-         {"camera eng_AT_camera#NULL#NULL#focus_control#distance  -> "}},
+    Case{"", "AT+QX_CCM_PARA=1,120", nullptr, "", "ATOK", {"camera " + kFocus + "120 -> success"}},
+    Case{"CameraFails", "AT+QX_CCM_PARA=1,120", all_fail, "", "ATOK", {"camera " + kFocus + "120 -> fail"}},
+    Case{"NoDistance", "AT+QX_CCM_PARA=1,", nullptr, "", "ATOK", {"camera " + kFocus + " -> "}},
     Case{"", "AT+QX_CCM_PARA=1," + std::string(200, '9'), nullptr, "", "ATOK",
          {"camera " + kFocus + std::string(127 - kFocus.size(), '9') + " -> "}}),
     by_tag);
 // clang-format on
-
-// No reading carries over to the next: each is judged against the limits alone.
-TEST_F(CameraTest, EachLightLeakReadingIsJudgedAlone) {
-    box.sequence("camera:front_light_leak", {"success#leak#-1000", "fail#cover open", "success#leak#0"});
-    for (auto [body, word] : {std::pair{"\r\n\"+Light:-1000\"\r\n", "ATNG"}, {"", "ATERROR"}, {"\r\n\"+Light:0\"\r\n", "ATOK"}})
-        EXPECT_EQ(serve("AT+MMICCM=F,11"), frame("AT+MMICCM=F,11", body, word));
-}
-
-// The camera service is asked once per line, in the station's order, and results are not kept.
-TEST_F(CameraTest, SelfTestResultsChangeBetweenReads) {
-    box.sequence("camera:" + kGetResult, {"success#r#af 0#ae 0", "success#r#af 1#ae 1"});
-    const std::string line = "AT+QX_CCM_SLTS=3,rear,main,0";
-    EXPECT_EQ(serve("AT+QX_CCM_SLTS=1,rear,main,0"), frame("AT+QX_CCM_SLTS=1,rear,main,0", "", "ATOK"));
-    EXPECT_EQ(serve(line), frame(line, "\r\n\"+af:0\"\r\n\r\n\"+ae:0\"\r\n", "ATOK"));
-    EXPECT_EQ(serve(line), frame(line, "\r\n\"+af:1\"\r\n\r\n\"+ae:1\"\r\n", "ATOK"));
-    std::vector<Event> camera;
-    for (const Event &e : box.event_list())
-        if (e.kind == "camera") camera.push_back(e);
-    ASSERT_EQ(camera.size(), 3u);
-    EXPECT_EQ(camera[0].detail, "eng_AT_camera#rear#main#auto_test_execute#params 0 -> success");
-    EXPECT_EQ(camera[2].detail, kGetResult + " -> success#r#af 1#ae 1");
-    EXPECT_LE(camera[0].ms, camera[1].ms);
-    EXPECT_LE(camera[1].ms, camera[2].ms);
-}
 
 }  // namespace

@@ -1,9 +1,7 @@
 // Display, touch and backlight commands: exact frames, the NV record, properties, panel
 // nodes and the test-app messages and activities, on phones with one panel and with two.
-#include <chrono>
 #include <cstring>
 #include <filesystem>
-#include <thread>
 
 #include "core/command_tables/handlers.h"
 #include "core/nv.h"
@@ -28,6 +26,7 @@ const char *kMainCali = "/sys/lcm/mainpanel_calidata", *kSubCali = "/sys/lcm/sub
 const char *kBadScreen = "bad_screen:null:null:null:null:null";
 
 std::string msg(const std::string &text, const std::string &reply = "ok") { return "message " + text + " -> " + reply + "\n"; }
+std::string q(const std::string &text) { return "\r\n\"" + text + "\"\r\n"; }  // a quoted body line
 
 // Every byte non-zero, so a stray write shows; fields given are set over the pattern.
 std::string nv_record(const Fields &fields) {
@@ -63,11 +62,7 @@ std::string case_name(const ::testing::TestParamInfo<Case> &info) {
 
 class DisplayTest : public InProcess {
 protected:
-    int saved_sp = 0;
-    void SetUp() override {
-        InProcess::SetUp();
-        saved_sp = is_sp;
-    }
+    int saved_sp = is_sp;
     void TearDown() override {
         is_sp = saved_sp;
         InProcess::TearDown();
@@ -77,11 +72,8 @@ protected:
     std::string without_panel(const std::string &detail) const {
         if (detail.empty()) return box.events();
         const std::string line = "panel " + detail + "\n";
+        wait_until([&] { return box.events().find(line) != std::string::npos; }, 2000);
         std::string log = box.events();
-        for (int i = 0; i < 100 && log.find(line) == std::string::npos; ++i) {
-            std::this_thread::sleep_for(std::chrono::milliseconds(20));
-            log = box.events();
-        }
         size_t at = log.find(line);
         EXPECT_NE(at, std::string::npos) << log;
         return at == std::string::npos ? log : log.erase(at, line.size());
@@ -114,38 +106,40 @@ TEST_P(DisplayLine, Answers) {
     for (const auto &[path, text] : c.nodes) EXPECT_EQ(box.read(path), text) << path;
 }
 
+const std::string kShowW = kLcm + "-e lcm_color W\n", kNotMain = q("main lcm not calibrate");
+const std::string kRegs = "/sys/class/leds/lm3697-backlight/registers", kBright = "/sys/lcm/lcm_brightness";
+const char *kAcl = "/sys/lcm/oled_acl", *kInfo = "/cache/recovery/last_test_info";
+
 // clang-format off
+// Colours and panel choice; a lost calibration restored from NV only for colours in [0xD7D7D8, 0xFFFFFF).
 INSTANTIATE_TEST_SUITE_P(Colours, DisplayLine, ::testing::Values(
     Case{.line = "AT+LCMT=1,R,G", .events = kLcm + "-e lcm_color R\n"},
     Case{.line = "AT+LCMT=1," + kLongArg + kLongArg, .tag = "Long", .events = kLcm + "-e lcm_color " + (kLongArg + kLongArg).substr(0, 86) + "\n"},
     Case{.line = "AT+LCMT=1", .word = "ERROR"},
-    Case{.line = "AT+LCMT=1,W", .tag = "Calibrated", .back = true, .events = kLcm + "-e lcm_color W\n",
+    Case{.line = "AT+LCMT=1,W", .tag = "Calibrated", .back = true, .events = kShowW,
          .nodes = {{kMainCali, "0xD7 0xD7 0xD8\n"}}},
     Case{.line = "AT+LCMT=1,W", .tag = "LowestColourRestored", .back = true, .files = {{kMainCali, kLost}},
-         .nv = {{nv::kMainPanelColour, 0xD7D7D8}},
-         .events = "setprop ro.sys.mainlcm.cali=14145496\n" + kLcm + "-e lcm_color W\n",
+         .nv = {{nv::kMainPanelColour, 0xD7D7D8}}, .events = "setprop ro.sys.mainlcm.cali=14145496\n" + kShowW,
          .panel = "main calibrate 1490540504", .nodes = {{kMainCali, "0xD7 0xD7 0xD8\n"}}},
     Case{.line = "AT+LCMT=1,W", .tag = "HighestColourRestored", .back = true, .files = {{kMainCali, kLost}},
-         .nv = {{nv::kMainPanelColour, 0xFFFFFE}},
-         .events = "setprop ro.sys.mainlcm.cali=16777214\n" + kLcm + "-e lcm_color W\n",
+         .nv = {{nv::kMainPanelColour, 0xFFFFFE}}, .events = "setprop ro.sys.mainlcm.cali=16777214\n" + kShowW,
          .panel = "main calibrate 1493172222", .nodes = {{kMainCali, "0xFF 0xFF 0xFE\n"}}},
     Case{.line = "AT+LCMT=1,W", .tag = "WhiteRefused", .back = true, .files = {{kMainCali, kLost}},
-         .nv = {{nv::kMainPanelColour, 0xFFFFFF}}, .body = "\r\n\"main lcm not calibrate\"\r\n", .word = "ATNG",
-         .nodes = {{kMainCali, kLost}}},
+         .nv = {{nv::kMainPanelColour, 0xFFFFFF}}, .body = kNotMain, .word = "ATNG", .nodes = {{kMainCali, kLost}}},
     Case{.line = "AT+LCMT=1,W", .tag = "TooDarkRefused", .back = true, .files = {{kMainCali, kLost}},
-         .nv = {{nv::kMainPanelColour, 0xD7D7D7}}, .body = "\r\n\"main lcm not calibrate\"\r\n", .word = "ATNG"},
+         .nv = {{nv::kMainPanelColour, 0xD7D7D7}}, .body = kNotMain, .word = "ATNG"},
     Case{.line = "AT+LCMT=1,W", .tag = "NvReadFails", .back = true, .fault = "nv-read", .files = {{kMainCali, kLost}},
-         .nv = {{nv::kMainPanelColour, 0xD7D7D8}}, .body = "\r\n\"main lcm not calibrate\"\r\n", .word = "ATNG"},
+         .nv = {{nv::kMainPanelColour, 0xD7D7D8}}, .body = kNotMain, .word = "ATNG"},
     Case{.line = "AT+LCMT=1,W", .tag = "NodeMissing", .back = true, .remove = {kMainCali},
-         .body = "\r\n\"get main lcm calibrate state failed\"\r\n", .word = "ATNG"},
+         .body = q("get main lcm calibrate state failed"), .word = "ATNG"},
     Case{.line = "AT+LCMT_BACK=1,B", .tag = "Restored", .back = true, .files = {{kSubCali, kLost}},
          .nv = {{nv::kMainPanelColour, 0xD7D7D8}, {nv::kBackPanelColour, 0xE0E0E0}},
          .events = "setprop ro.sys.sublcm.cali=14737632\n" + kLcm + "-e lcm_color B --ei display_id 4096\n",
          .panel = "sub calibrate 1491132640", .nodes = {{kSubCali, "0xE0 0xE0 0xE0\n"}, {kMainCali, "0xD7 0xD7 0xD8\n"}}},
     Case{.line = "AT+LCMT_BACK=1,B", .tag = "NotRestorable", .back = true, .files = {{kSubCali, kLost}},
-         .nv = {{nv::kMainPanelColour, 0xD7D7D8}}, .body = "\r\n\"sub lcm not calibrate\"\r\n", .word = "ATNG"},
+         .nv = {{nv::kMainPanelColour, 0xD7D7D8}}, .body = q("sub lcm not calibrate"), .word = "ATNG"},
     Case{.line = "AT+LCMT_BACK=1,B", .tag = "NodeMissing", .back = true, .remove = {kSubCali},
-         .body = "\r\n\"get sub lcm calibrate state failed\"\r\n", .word = "ATNG"},
+         .body = q("get sub lcm calibrate state failed"), .word = "ATNG"},
     Case{.line = "AT+LCMT_BACK=1,B", .tag = "OnePanel", .files = {{kSubCali, kLost}}, .nodes = {{kSubCali, kLost}}},
     Case{.line = "AT+LCMT=0", .events = kLcm + "\n"},
     Case{.line = "AT+LCMT_BACK=0", .back = true, .events = kLcm + "\n"},
@@ -153,27 +147,29 @@ INSTANTIATE_TEST_SUITE_P(Colours, DisplayLine, ::testing::Values(
     Case{.line = "AT+LCMT=2,0", .events = "setprop persist.sys.em.lcm_choose=0\n" + kFloating + kChoose + "-e exit 1\n"},
     Case{.line = "AT+LCMT_BACK=2,1", .back = true,
          .events = "setprop persist.sys.em.lcm_choose=1\n" + kFloating + kChoose + "-e enter 1 --ei display_id 4096\n"},
-    Case{.line = "AT+LCMT=3", .word = "ERROR"},
+    // The backlight driver's registers, and the panel's brightness and VDDI flags.
     Case{.line = "AT+QX_LCM_IC=0", .word = "ATOK"},
-    Case{.line = "AT+QX_LCM_IC=0", .tag = "WrongDriver", .files = {{"/sys/class/leds/lm3697-backlight/registers", "BRT: 1\n"}},
+    Case{.line = "AT+QX_LCM_IC=0", .tag = "WrongDriver", .files = {{kRegs, "BRT: 1\n"}},
          .body = "BRT: 1\n", .word = "ATNG"},
-    Case{.line = "AT+QX_LCM_IC=0", .tag = "Empty", .files = {{"/sys/class/leds/lm3697-backlight/registers", ""}}, .word = "ATNG"},
+    Case{.line = "AT+QX_LCM_IC=0", .tag = "Empty", .files = {{kRegs, ""}}, .word = "ATNG"},
     Case{.line = "AT+QX_LCM_IC=0", .tag = "Missing", .remove = {"/sys/class/leds/lm3697-backlight"}, .word = "ATNG"},
-    Case{.line = "AT+QX_LCM_IC=2", .body = "\r\n\"a\"\r\n", .word = "ATOK"},
-    Case{.line = "AT+QX_LCM_IC=2", .tag = "Set", .files = {{"/sys/lcm/lcm_brightness", "01"}}, .body = "\r\n\"b\"\r\n", .word = "ATOK"},
-    Case{.line = "AT+QX_LCM_IC=2", .tag = "LineEnd", .files = {{"/sys/lcm/lcm_brightness", "01\n"}}, .body = "\r\n\"a\"\r\n", .word = "ATOK"},
-    Case{.line = "AT+QX_LCM_IC=3", .body = "\r\n\"1\"\r\n", .word = "ATOK"},
-    Case{.line = "AT+QX_LCM_IC=3", .tag = "Missing", .remove = {"/sys/lcm/lcm_vddi_high"}, .body = "\r\n\"0\"\r\n", .word = "ATOK"},
-    Case{.line = "AT+QX_LCM_IC=1", .word = "ERROR"}), case_name);
+    Case{.line = "AT+QX_LCM_IC=2", .body = q("a"), .word = "ATOK"},
+    Case{.line = "AT+QX_LCM_IC=2", .tag = "Set", .files = {{kBright, "01"}}, .body = q("b"), .word = "ATOK"},
+    Case{.line = "AT+QX_LCM_IC=2", .tag = "LineEnd", .files = {{kBright, "01\n"}}, .body = q("a"), .word = "ATOK"},
+    Case{.line = "AT+QX_LCM_IC=3", .body = q("1"), .word = "ATOK"},
+    Case{.line = "AT+QX_LCM_IC=3", .tag = "Missing", .remove = {"/sys/lcm/lcm_vddi_high"}, .body = q("0"),
+         .word = "ATOK"},
+    Case{.line = "AT+LCMT=3", .word = "ERROR"}), case_name);
 
+// Keeping the screen awake: wake lock, the OLED ACL node, test-app messages, the item file in AT mode.
 INSTANTIATE_TEST_SUITE_P(KeepAwake, DisplayLine, ::testing::Values(
-    Case{.line = "AT+QXSP=0", .events = kWake + msg("keep_screen_on 1,display_id:0"), .nodes = {{"/sys/lcm/oled_acl", "0"}}},
+    Case{.line = "AT+QXSP=0", .events = kWake + msg("keep_screen_on 1,display_id:0"), .nodes = {{kAcl, "0"}}},
     Case{.line = "AT+QXSP=0", .tag = "Refused", .fault = "testapp-refuse", .word = "ERROR",
          .events = kWake + msg("keep_screen_on 1,display_id:0", "error")},
     Case{.line = "AT+QXSP=1", .events = "wakelock release ftcmd\n" + msg("keep_screen_on 0,display_id:0")},
-    Case{.line = "AT+QXSP_BACK=0", .tag = "OnePanel", .nodes = {{"/sys/lcm/oled_acl", "1\n"}}},
+    Case{.line = "AT+QXSP_BACK=0", .tag = "OnePanel", .nodes = {{kAcl, "1\n"}}},
     Case{.line = "AT+QXSP_BACK=0", .back = true, .events = kWake + msg("keep_screen_on 1,display_id:4096"),
-         .nodes = {{"/sys/lcm/oled_acl", "0"}}},
+         .nodes = {{kAcl, "0"}}},
     Case{.line = "AT+QXSP_BACK=1", .tag = "Silent", .back = true, .fault = "testapp-silent", .word = "ATERROR",
          .events = "wakelock release ftcmd\n" + msg("keep_screen_on 0,display_id:4096", "(silent)")},
     Case{.line = "AT+QXSP=3", .events = msg("keep_screen_on 5")},
@@ -181,13 +177,12 @@ INSTANTIATE_TEST_SUITE_P(KeepAwake, DisplayLine, ::testing::Values(
          .events = msg("keep_screen_on 5", "busy")},
     Case{.line = "AT+QXSP=2", .word = "ERROR"},
     Case{.line = "AT+QXBS=1", .events = "setprop persist.sys.keep.screenon=1\n" + msg("keep_screen_on 3,display_id:0"),
-         .nodes = {{"/sys/lcm/oled_acl", "0"}}},
-    Case{.line = "AT+QXBS=1", .tag = "AtMode", .sp = 1, .nodes = {{"/cache/recovery/last_test_info", "keepscreen=yes\n"},
-         {"/sys/lcm/oled_acl", "1\n"}}},
+         .nodes = {{kAcl, "0"}}},
+    Case{.line = "AT+QXBS=1", .tag = "AtMode", .sp = 1, .nodes = {{kInfo, "keepscreen=yes\n"}, {kAcl, "1\n"}}},
     Case{.line = "AT+QXBS=1", .tag = "AtModeNoItemFile", .sp = 1, .remove = {"/cache/recovery"}, .word = "ERROR"},
-    Case{.line = "AT+QXBS=0", .files = {{"/cache/recovery/last_test_info", "a=1\nkeepscreen=yes\n"}},
+    Case{.line = "AT+QXBS=0", .files = {{kInfo, "a=1\nkeepscreen=yes\n"}},
          .events = "setprop persist.sys.keep.screenon=0\n" + msg("keep_screen_on 4,display_id:0"),
-         .nodes = {{"/cache/recovery/last_test_info", "a=1\n"}}},
+         .nodes = {{kInfo, "a=1\n"}}},
     Case{.line = "AT+QXBS=0", .tag = "AtModeNoItem", .sp = 1},
     Case{.line = "AT+QXBS=0", .tag = "Refused", .fault = "testapp-refuse", .word = "ERROR",
          .events = "setprop persist.sys.keep.screenon=0\n" + msg("keep_screen_on 4,display_id:0", "error")},
@@ -199,6 +194,7 @@ INSTANTIATE_TEST_SUITE_P(KeepAwake, DisplayLine, ::testing::Values(
          .events = msg("keep_screen_on 4,display_id:4096", "error")},
     Case{.line = "AT+QXBS=2", .word = "ERROR"}), case_name);
 
+// Backlight steps and percentages (0..100, read as unsigned), and wake-up with its result query.
 INSTANTIATE_TEST_SUITE_P(BacklightAndWake, DisplayLine, ::testing::Values(
     Case{.line = "AT+QXSCB=1,0", .events = msg("backlight 1 display_id:0")},
     Case{.line = "AT+QXSCB=1,2", .tag = "Refused", .fault = "testapp-refuse", .word = "ERROR",
@@ -220,39 +216,39 @@ INSTANTIATE_TEST_SUITE_P(BacklightAndWake, DisplayLine, ::testing::Values(
     Case{.line = "AT+QXWAKE=1", .events = msg("wakeup 1 display_id:0")},
     Case{.line = "AT+QXWAKE=2", .tag = "Silent", .fault = "testapp-silent", .word = "ERROR",
          .events = msg("wakeup 2 display_id:0", "(silent)")},
-    Case{.line = "AT+QXWAKE=0", .body = "\r\n\"wake:1\"\r\n", .events = msg("wakeup 0 display_id:0")},
-    Case{.line = "AT+QXWAKE=0", .tag = "Failed", .fault = "testapp-refuse", .body = "\r\n\"wake:0\"\r\n",
+    Case{.line = "AT+QXWAKE=0", .body = q("wake:1"), .events = msg("wakeup 0 display_id:0")},
+    Case{.line = "AT+QXWAKE=0", .tag = "Failed", .fault = "testapp-refuse", .body = q("wake:0"),
          .events = msg("wakeup 0 display_id:0", "error")},
     Case{.line = "AT+QXWAKE=0", .tag = "Other", .replies = {{"wakeup 0 display_id:0", "ok?"}}, .word = "ERROR",
          .events = msg("wakeup 0 display_id:0", "ok?")},
     Case{.line = "AT+QXWAKE_BACK=0", .back = true, .replies = {{"wakeup 0 display_id:4096", "testing"}},
-         .body = "\r\n\"wake:2\"\r\n", .events = msg("wakeup 0 display_id:4096", "testing")},
-    Case{.line = "AT+QXWAKE_BACK=1", .tag = "OnePanel"},
+         .body = q("wake:2"), .events = msg("wakeup 0 display_id:4096", "testing")},
     Case{.line = "AT+QXWAKE=3", .word = "ERROR"}), case_name);
 
 const std::string kTestFile = "/data/engineermode/tp_at_sensor_test";
 const std::string kCaliFile = "/data/engineermode/tp_at_sensor_cali";
-const std::string kKeyFile = "/sys/touchscreen/factory_key";
+const std::string kKeyFile = "/sys/touchscreen/factory_key", kSupport = "/sys/touchscreen/cali_support";
+const std::string kSelfCheck0 = "touchscreen_selfcheck 0,display_id:0";
 
+// The touch panel: the test app's verdicts, or on a panel fitted without a screen the library and verdict files.
 INSTANTIATE_TEST_SUITE_P(Touch, DisplayLine, ::testing::Values(
-    Case{.line = "AT+QXTOUCH=0", .body = "\r\n\"touchscreen:1\"\r\n", .events = msg("touchscreen_selfcheck 0,display_id:0")},
-    Case{.line = "AT+QXTOUCH=0", .tag = "Testing", .replies = {{"touchscreen_selfcheck 0,display_id:0", "testing"}},
-         .body = "\r\n\"touchscreen:2\"\r\n", .events = msg("touchscreen_selfcheck 0,display_id:0", "testing")},
-    Case{.line = "AT+QXTOUCH=0", .tag = "Failed", .fault = "testapp-refuse", .body = "\r\n\"touchscreen:0\"\r\n",
-         .events = msg("touchscreen_selfcheck 0,display_id:0", "error")},
+    Case{.line = "AT+QXTOUCH=0", .body = q("touchscreen:1"), .events = msg(kSelfCheck0)},
+    Case{.line = "AT+QXTOUCH=0", .tag = "Testing", .replies = {{kSelfCheck0, "testing"}}, .body = q("touchscreen:2"),
+         .events = msg(kSelfCheck0, "testing")},
+    Case{.line = "AT+QXTOUCH=0", .tag = "Failed", .fault = "testapp-refuse", .body = q("touchscreen:0"),
+         .events = msg(kSelfCheck0, "error")},
     Case{.line = "AT+QXTOUCH=0", .tag = "Silent", .fault = "testapp-silent", .word = "ERROR",
-         .events = msg("touchscreen_selfcheck 0,display_id:0", "(silent)")},
+         .events = msg(kSelfCheck0, "(silent)")},
     Case{.line = "AT+QXTOUCH=0", .tag = "Screenless", .files = {{kKeyFile, kBadScreen}, {kTestFile, "Pass\n"}},
-         .body = "\r\n\"touchscreen:1\"\r\n"},
+         .body = q("touchscreen:1")},
     Case{.line = "AT+QXTOUCH=0", .tag = "ScreenlessTesting", .files = {{kKeyFile, kBadScreen}, {kTestFile, "testing"}},
-         .body = "\r\n\"touchscreen:2\"\r\n"},
+         .body = q("touchscreen:2")},
     Case{.line = "AT+QXTOUCH=0", .tag = "ScreenlessNoVerdict", .files = {{kKeyFile, kBadScreen}}, .word = "ERROR"},
     Case{.line = "AT+QXTOUCH_BACK=0", .tag = "Screenless", .back = true,
          .files = {{kKeyFile, "bad_screen_sec:null:null:null:null:null"}, {kTestFile + "_back", "Fail"}},
-         .body = "\r\n\"touchscreen:0\"\r\n"},
+         .body = q("touchscreen:0")},
     Case{.line = "AT+QXTOUCH_BACK=0", .tag = "MainScreenless", .back = true, .files = {{kKeyFile, kBadScreen}},
-         .body = "\r\n\"touchscreen:1\"\r\n", .events = msg("touchscreen_selfcheck 0,display_id:4096")},
-    Case{.line = "AT+QXTOUCH_BACK=0", .tag = "OnePanel"},
+         .body = q("touchscreen:1"), .events = msg("touchscreen_selfcheck 0,display_id:4096")},
     Case{.line = "AT+QXTOUCH=1,3", .events = msg("touchscreen_selfcheck 1 3,display_id:0")},
     Case{.line = "AT+QXTOUCH=1," + kLongArg, .tag = "Long", .events = msg("touchscreen_selfcheck 1 " + kLongArg.substr(0, 25))},
     Case{.line = "AT+QXTOUCH=1", .word = "ERROR"},
@@ -278,26 +274,24 @@ INSTANTIATE_TEST_SUITE_P(Touch, DisplayLine, ::testing::Values(
     Case{.line = "AT+QXTOUCH=WE,0", .tag = "Edge", .files = {{"/sys/touch/wafer_edge", "255\n"}}, .body = "\"0\""},
     Case{.line = "AT+QXTOUCH=WE,0", .tag = "Missing", .remove = {"/sys/touch"}, .body = "\"0\""},
     Case{.line = "AT+QXTOUCH=WE,1", .files = {{"/sys/touch/wafer_edge", "7ab"}}, .body = "\"7\""},
-    Case{.line = "AT+QXTOUCH=WE,1", .tag = "Missing", .remove = {"/sys/touch"}, .body = "\"0\""},
-    Case{.line = "AT+QX_TPL_CAL=0", .files = {{"/sys/touchscreen/cali_support", "3\n"}}, .body = "\"1\"", .word = "ATOK"},
-    Case{.line = "AT+QX_TPL_CAL=0", .tag = "BackOnly", .files = {{"/sys/touchscreen/cali_support", "2\n"}}, .body = "\"0\"",
-         .word = "ATOK"},
-    Case{.line = "AT+QX_TPL_CAL_BACK=0", .back = true, .files = {{"/sys/touchscreen/cali_support", "2\n"}},
-         .body = "\"1\"", .word = "ATOK"},
-    Case{.line = "AT+QX_TPL_CAL=0", .tag = "Missing", .remove = {"/sys/touchscreen/cali_support"},
+    Case{.line = "AT+QX_TPL_CAL=0", .files = {{kSupport, "3\n"}}, .body = "\"1\"", .word = "ATOK"},
+    Case{.line = "AT+QX_TPL_CAL=0", .tag = "BackOnly", .files = {{kSupport, "2\n"}}, .body = "\"0\"", .word = "ATOK"},
+    Case{.line = "AT+QX_TPL_CAL_BACK=0", .back = true, .files = {{kSupport, "2\n"}}, .body = "\"1\"", .word = "ATOK"},
+    Case{.line = "AT+QX_TPL_CAL=0", .tag = "Missing", .remove = {kSupport},
          .body = "\"read cali_support error:No such file or directory\"", .word = "ATNG"},
     Case{.line = "AT+QXTOUCH=9", .word = "ERROR"},
     Case{.line = "AT+MMITW=1", .events = "activity com.pyxa.engineermode/.FingerTouchActivity  \n"},
     Case{.line = "AT+MMITW=0", .events = "activity com.pyxa.engineermode/.FingerTouchActivity  --ez finish true\n"},
     Case{.line = "AT+MMITW=2", .word = "ERROR"}), case_name);
 
+// Panel identifiers and colour, the second-screen switch and the wallpaper in the NV record.
 INSTANTIATE_TEST_SUITE_P(PanelData, DisplayLine, ::testing::Values(
-    Case{.line = "AT+QXLCMID=0", .body = "\r\n\"PX5012-BOE-NT37701\"\r\n"},
-    Case{.line = "AT+QXLCMID=0", .tag = "CrLf", .files = {{"/sys/lcm/lcm_id", "AB\rC\nD"}}, .body = "\r\n\"AB\"\r\n"},
+    Case{.line = "AT+QXLCMID=0", .body = q("PX5012-BOE-NT37701")},
+    Case{.line = "AT+QXLCMID=0", .tag = "CrLf", .files = {{"/sys/lcm/lcm_id", "AB\rC\nD"}}, .body = q("AB")},
     Case{.line = "AT+QXLCMID=0", .tag = "Long", .files = {{"/sys/lcm/lcm_id", kLongArg}},
-         .body = "\r\n\"" + kLongArg.substr(0, 49) + "\"\r\n"},
+         .body = q(kLongArg.substr(0, 49))},
     Case{.line = "AT+QXLCMID=0", .tag = "Missing", .remove = {"/sys/lcm/lcm_id"}, .word = "ERROR"},
-    Case{.line = "AT+QXPID=0", .body = "\r\n\"0x3A\"\r\n"},
+    Case{.line = "AT+QXPID=0", .body = q("0x3A")},
     Case{.line = "AT+QXPID=1", .word = "ERROR"},
     Case{.line = "AT+QX_LCM_COLOR=0", .body = "1"},
     Case{.line = "AT+QX_LCM_COLOR=0,x", .files = {{"/sys/lcm/lcm_color", "01\n"}}, .body = "2"},
@@ -316,13 +310,12 @@ INSTANTIATE_TEST_SUITE_P(PanelData, DisplayLine, ::testing::Values(
     Case{.line = "AT+SECSCREEN=2", .nv = {{nv::kSpecialProduct, 0x40}}, .body = "\"disable\"", .word = "ATOK"},
     Case{.line = "AT+SECSCREEN=2", .tag = "Enabled", .body = "\"enable\"", .word = "ATOK"},
     Case{.line = "AT+SECSCREEN=2", .tag = "NvReadFails", .fault = "nv-read", .word = "ATNG"},
-    Case{.line = "AT+SECSCREEN=3", .body = "invalid command: AT+SECSCREEN=3", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=1,42", .events = "nv write\n", .nv_after = {{nv::kWallpaperId, 42}}},
     Case{.line = "AT+QXMMIUI=1,4a", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=1,99999999999", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=1", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=1,42", .tag = "NvWriteFails", .fault = "nv-write", .word = "ERROR"},
-    Case{.line = "AT+QXMMIUI=0", .nv = {{nv::kWallpaperId, 7}}, .body = "\r\n\"7\"\r\n"},
+    Case{.line = "AT+QXMMIUI=0", .nv = {{nv::kWallpaperId, 7}}, .body = q("7")},
     Case{.line = "AT+QXMMIUI=0", .tag = "NvReadFails", .fault = "nv-read", .word = "ERROR"},
     Case{.line = "AT+QXMMIUI=2", .word = "ERROR"}), case_name);
 // clang-format on
@@ -340,17 +333,6 @@ TEST_F(DisplayTest, BacklightFormsAndCase) {
     EXPECT_EQ(mmi_backlight_test_handler(back, 36, resp), RC_OK);
     EXPECT_EQ(box.events(), msg("backlight 1 display_id:0") + msg("backlight 1 display_id:0") +
                                 msg("backlight 0 display_id:4096"));
-}
-
-// A restored panel reads as calibrated: the next colour is shown without a second restore.
-TEST_F(DisplayTest, RestoreHappensOnce) {
-    two_panels();
-    box.write("/.sim/nv.bin", nv_record({{nv::kMainPanelColour, 0xD7D7D8}}));
-    box.write(kMainCali, kLost);
-    EXPECT_EQ(serve("AT+LCMT=1,W"), "AT+LCMT=1,W\r\n\r\nOK\r\n");
-    EXPECT_EQ(serve("AT+LCMT=1,R"), "AT+LCMT=1,R\r\n\r\nOK\r\n");
-    EXPECT_EQ(without_panel("main calibrate 1490540504"),
-              "setprop ro.sys.mainlcm.cali=14145496\n" + kLcm + "-e lcm_color W\n" + kLcm + "-e lcm_color R\n");
 }
 
 // The panel model takes only what its driver would: decimal 0x58RRGGBB, one line end
