@@ -114,6 +114,7 @@ const char *kAcl = "/sys/lcm/oled_acl", *kInfo = "/cache/recovery/last_test_info
 // Colours and panel choice; a lost calibration restored from NV only for colours in [0xD7D7D8, 0xFFFFFF).
 INSTANTIATE_TEST_SUITE_P(Colours, DisplayLine, ::testing::Values(
     Case{.line = "AT+LCMT=1,R,G", .events = kLcm + "-e lcm_color R\n"},
+    Case{.line = "AT+LCMT=1,,R", .tag = "EmptyFieldSkipped", .events = kLcm + "-e lcm_color R\n"},
     Case{.line = "AT+LCMT=1," + kLongArg + kLongArg, .tag = "Long", .events = kLcm + "-e lcm_color " + (kLongArg + kLongArg).substr(0, 86) + "\n"},
     Case{.line = "AT+LCMT=1", .word = "ERROR"},
     Case{.line = "AT+LCMT=1,W", .tag = "Calibrated", .back = true, .events = kShowW,

@@ -307,6 +307,20 @@ TEST_F(StreamTest, ValuesChangeUntilAFailedReadingEndsTheStream) {
     EXPECT_EQ(got.substr(0, kStart.size() + 4), kStart + "\r\n-4");
 }
 
+// A stop and a start within one period: the old stream ends instead of waking beside the
+// new one, so the new stream's readings stay a full period apart.
+TEST_F(StreamTest, QuickRestartKeepsOneStream) {
+    send_line("AT+QXZLJC=0,1");
+    collect(kStart.size() + 4, 3000);
+    send_line("AT+QXZLJC=0,0");
+    send_line("AT+QXZLJC=0,1");
+    collect(3 * kStart.size() + 6 * 4, 3000);
+    stop();
+    std::vector<long long> at = readings();
+    ASSERT_GE(at.size(), 6u);
+    for (size_t i = 2; i < at.size(); ++i) EXPECT_GE(at[i] - at[i - 1], 200) << "reading " << i;
+}
+
 TEST_F(SensorsTest, SecondCalibrationReplacesTheFirst) {
     box.sequence("sensor:80", {"1,100,200,300", "1,-4,5.5,-6.5"});
     for (int i = 0; i < 2; ++i) expect_answer("AT+QXTLY=0", "", "OK");
