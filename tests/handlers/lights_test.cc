@@ -1,5 +1,4 @@
-// Vibrator and indicator lights: exact frames, what the LED and vibrator nodes were written,
-// the panels' brightness, and the timing of the vibration and blink workers.
+// Vibrator and lights: exact frames, the LED, vibrator and panel nodes, and the vibration and blink workers' timing.
 #include <cstring>
 #include <filesystem>
 #include <functional>

@@ -1,5 +1,4 @@
-// NFC commands: exact frames, the NCI messages the phone sends to its controller (as the
-// emulated controller records them), the test-app messages, and the 2-second field window.
+// NFC commands: exact frames, the NCI messages the controller got, the test-app messages, the 2-second field window.
 #include <algorithm>
 #include <chrono>
 #include <filesystem>

@@ -1,6 +1,5 @@
-// The LED ring's trim table: the default restore, the white-balance and colour steps.
-// Each case checks the frame, every line loaded into the two drivers in order, and what
-// the drivers' registers hold afterwards.
+// The LED ring's trim table (default restore, white-balance and colour steps): the frame, every line loaded
+// into the two drivers in order, and what the registers hold afterwards.
 #include <cctype>
 #include <cstdio>
 #include <filesystem>

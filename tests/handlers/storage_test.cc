@@ -1,5 +1,4 @@
-// Storage commands: exact frames (bare CR and LF endings included), the test-app messages,
-// shell commands and files they leave, and the OTG worker's property.
+// Storage commands: exact frames (bare CR and LF included), test-app messages, shell commands, files, OTG worker.
 #include <filesystem>
 #include <functional>
 
@@ -204,8 +203,7 @@ INSTANTIATE_TEST_SUITE_P(Otg, StorageLine, ::testing::Values(
     Case{"", "AT+QX_OTG_UDRW=2", nullptr, "", "ATERROR", {}, "message"}), by_tag);
 // clang-format on
 
-// The worker tries once a second, exactly as often as it was told: a device that shows on
-// a later read is not seen. Durations come from the time stamps of the property changes.
+// The worker tries once a second, as often as it was told (a later device is not seen); times from the property's.
 const std::string kHub = "T:  Bus=01 Lev=00 Prnt=00 Port=00 Cnt=00 Dev#=  1 Spd=480  MxCh= 1\n"
                          "I:* If#= 0 Alt= 0 #EPs= 1 Cls=09(hub  ) Sub=00 Prot=00 Driver=hub";
 const std::string kStick = kHub + "\nI:* If#= 0 Alt= 0 #EPs= 2 Cls=08(stor.) Sub=06 Prot=50 Driver=usb-storage";
@@ -248,8 +246,7 @@ INSTANTIATE_TEST_SUITE_P(Storage, OtgWorker, ::testing::Values(
     OtgRun{"NoUsbNode", 600, {}, false}),  // ends at its first try, not after 600
     [](const ::testing::TestParamInfo<OtgRun> &info) { return std::string(info.param.name); });
 
-// A stress test counts as running for its seconds after its start: a second start within
-// them is refused by the process list, one after them starts the program again.
+// A second start within the stress run's seconds finds it in the process list; one after them starts it again.
 TEST_F(StorageTest, DdrStressStartsAgainOnlyAfterItsSeconds) {
     const std::string line = "AT+QXDDR=1,1,0", ok = frame(line, "", "OK");
     EXPECT_EQ(serve(line), ok);
