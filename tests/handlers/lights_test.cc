@@ -1,16 +1,13 @@
-// Vibrator and indicator lights: exact frames, what the LED and vibrator nodes were
-// written, the panels' brightness, and the timing of the vibration and blink workers.
-#include <chrono>
+// Vibrator and lights: exact frames, the LED, vibrator and panel nodes, and the vibration and blink workers' timing.
 #include <cstring>
 #include <filesystem>
 #include <functional>
-#include <thread>
 
 #include "handlers/lights.h"
 #include "platform/factory.h"
-#include "platform/sim/sim.h"
 #include "tests/support/checks.h"
 #include "tests/support/in_process.h"
+#include "tests/support/test_name.h"
 
 namespace {
 
@@ -32,29 +29,25 @@ using Setup = std::function<void(const Sandbox &)>;
 Setup rm(const char *path) { return [=](const Sandbox &b) { std::filesystem::remove(b.path(path)); }; }
 Setup fault(const char *name) { return [=](const Sandbox &b) { b.fault(name); }; }
 Setup rep(const char *message, const char *reply) { return [=](const Sandbox &b) { b.reply(message, reply); }; }
-Setup config(const char *key, std::string value) {
-    return [=](const Sandbox &b) { sim::write_kv(b.path("/.sim/config"), key, &value); };
+Setup config(const char *key, const char *value) {
+    return [=](const Sandbox &b) { b.sequence(std::string("config:") + key, {value}); };
 }
-Setup project(const char *name) { return config("project", name); }
 Setup all(std::initializer_list<Setup> steps) {
     return [v = std::vector<Setup>(steps)](const Sandbox &b) {
         for (const auto &s : v) s(b);
     };
 }
+Setup put(const char *path) { return [=](const Sandbox &b) { b.write(path, "0\n"); }; }
 void at_mode(const Sandbox &) { is_sp = 1; }
 const Setup back_panel = config("calibrate_items", "\"double_lcm_support\""), app_refuses = fault("testapp-refuse");
-const Setup engineering =
-    all({project("WQ2207_EX"), [](const Sandbox &b) { b.write("/sys/class/leds/green/engineering", "0\n"); }});
-Setup drivers(bool a, bool bdrv) {  // the ring's two drivers instead of the single one
-    return [=](const Sandbox &b) {
-        std::filesystem::remove(b.path(kEffect));
-        if (a) b.write("/sys/class/leds/aw22xxx_led_a/effect", "0\n");
-        if (bdrv) b.write("/sys/class/leds/aw22xxx_led_b/effect", "0\n");
-    };
-}
+const Setup back_at_mode = all({at_mode, back_panel});
+const Setup engineering = all({config("project", "WQ2207_EX"), put("/sys/class/leds/green/engineering")});
+// The ring's two drivers instead of the single one.
+const Setup only_a = all({rm(kEffect), put("/sys/class/leds/aw22xxx_led_a/effect")}),
+            only_b = all({rm(kEffect), put("/sys/class/leds/aw22xxx_led_b/effect")});
 
 struct Case {
-    std::string name, line, body, word;
+    std::string line, body, word;
     std::string events;  // the whole record of device effects
     std::vector<std::pair<const char *, const char *>> nodes = {};
     Setup setup = nullptr;
@@ -81,13 +74,12 @@ protected:
     // The "led" events once count of them have been recorded (bounded wait).
     std::vector<Event> leds(size_t count, int ms = 3000) const {
         std::vector<Event> out;
-        for (int waited = 0; waited <= ms; waited += 20) {
+        wait_until([&] {
             out.clear();
             for (const Event &e : box.event_list())
                 if (e.kind == "led") out.push_back(e);
-            if (out.size() >= count) break;
-            std::this_thread::sleep_for(std::chrono::milliseconds(20));
-        }
+            return out.size() >= count;
+        }, ms);
         return out;
     }
     static std::vector<std::string> details(const std::vector<Event> &ev, size_t from = 0, size_t n = 99) {
@@ -109,120 +101,103 @@ TEST_P(LightsLine, Answers) {
     EXPECT_EQ(box.read("/.sim/nv.bin"), nv_record(c.assembly_after));
 }
 
-const std::string kKeepBack = "wakelock acquire 1 ftcmd\nmessage keep_screen_on 1,display_id:4096 -> ok\n";
+const std::string kKeepBack = "wakelock acquire 1 ftcmd\nmessage keep_screen_on 1,display_id:4096 -> ";
+const std::string kBatteryMode = "message battery_mode set 0,display_id:4096 -> ", kSaveStop = "service-start "
+    "com.zdr.SuperPowerSave/.SuperPowerSaveService intent.action.SUPER_POWER_SAVE_SERVICE --es service_action stop\n";
+const std::string kAirplane = "\r\nexit airplane mode failed\r\n", kRingFailed = "\r\nring_light failed\r\n";
+const std::string kSkip = "setprop persist.sys.lockguide.skip=yes\n";
+std::string ring(const char *message, const char *reply = "ok") {  // the test app asked to light the ring
+    return std::string("message ring_light ") + message + ",display_id:4096 -> " + reply + "\n";
+}
+const char *kOld0 = "1023\n";  // the panel nodes' value before the line
 
 INSTANTIATE_TEST_SUITE_P(Lights, LightsLine, ::testing::Values(
-    Case{"VibratorOff", "AT+EDFT=6,0", "", "OK", "led vibrator/activate 0\n"},
-    Case{"ButtonOn", "AT+EDFT=5,1", "", "OK", "", {{kButton, "255"}}},
-    Case{"ButtonOff", "AT+EDFT=5,0", "", "OK", "", {{kButton, "0"}}},
-    Case{"ButtonMissing", "AT+EDFT=5,1", "", "ERROR", "", {}, rm(kButton)},
-    Case{"PanelWhite", "AT+EDFT=0,5", "", "OK", kLcm + "-e lcm_color W\n", {{kPanel0, "2047"}}},
-    Case{"PanelWhiteAtMode", "AT+EDFT=0,5", "", "OK", "fb blank 1\n", {{kPanel0, "2047"}}, at_mode},
-    Case{"PanelLevelWritesMax", "AT+EDFT=0,5,3", "", "OK", "fb blank 1\n", {{kPanel0, "2047"}}},
-    Case{"PanelLevelAtMax", "AT+EDFT=0,5,2047", "", "OK", "fb blank 1\n", {{kPanel0, "2047"}}},
-    Case{"PanelLevelAboveMax", "AT+EDFT=0,5,2048", "", "ERROR", "fb blank 1\n", {{kPanel0, "1023\n"}}},
-    Case{"PanelLevelNegative", "AT+EDFT=0,5,-1", "", "ERROR", "fb blank 1\n", {{kPanel0, "1023\n"}}},
-    Case{"PanelLevelMissing", "AT+EDFT=0,5,", "", "ERROR", "", {{kPanel0, "1023\n"}}},
-    Case{"PanelOffAtMode", "AT+EDFT=0,0", "", "OK", "fb blank 0\n", {{kPanel0, "0"}}, at_mode},
-    Case{"PanelOff", "AT+EDFT=0,0", "", "OK", "", {{kPanel0, "0"}}},
-    Case{"PanelDark", "AT+EDFT=0,1", "", "OK", kLcm + "\n", {{kPanel0, "0"}}},
-    Case{"PanelDarkAtMode", "AT+EDFT=0,1", "", "OK", "", {{kPanel0, "0"}}, at_mode},
-    Case{"Unknown", "AT+EDFT=7,1", "", "ERROR", ""},
-    Case{"BackWithoutBackPanel", "AT+EDFT_BACK=0,5", "", "OK", "", {{kPanel1, "0\n"}}},
-    Case{"BackWhite", "AT+EDFT_BACK=0,5", "", "ATOK", kKeepBack + kLcm + "-e lcm_color W --ei display_id 4096\n",
+    Case{"AT+EDFT=5,1", "", "OK", "", {{kButton, "255"}}},
+    Case{"AT+EDFT=5,0", "", "OK", "", {{kButton, "0"}}},
+    Case{"AT+EDFT=5,1", "", "ERROR", "", {}, rm(kButton)},
+    Case{"AT+EDFT=0,5", "", "OK", kLcm + "-e lcm_color W\n", {{kPanel0, "2047"}}},
+    Case{"AT+EDFT=0,5", "", "OK", "fb blank 1\n", {{kPanel0, "2047"}}, at_mode},
+    Case{"AT+EDFT=0,5,0", "", "OK", "fb blank 1\n", {{kPanel0, "2047"}}},
+    Case{"AT+EDFT=0,5,2047", "", "OK", "fb blank 1\n", {{kPanel0, "2047"}}},
+    Case{"AT+EDFT=0,5,2048", "", "ERROR", "fb blank 1\n", {{kPanel0, kOld0}}},
+    Case{"AT+EDFT=0,5,-1", "", "ERROR", "fb blank 1\n", {{kPanel0, kOld0}}},
+    Case{"AT+EDFT=0,5,", "", "ERROR", "", {{kPanel0, kOld0}}},
+    Case{"AT+EDFT=0,0", "", "OK", "fb blank 0\n", {{kPanel0, "0"}}, at_mode},
+    Case{"AT+EDFT=0,0", "", "OK", "", {{kPanel0, "0"}}},
+    Case{"AT+EDFT=0,1", "", "OK", kLcm + "\n", {{kPanel0, "0"}}},
+    Case{"AT+EDFT=0,1", "", "OK", "", {{kPanel0, "0"}}, at_mode},
+    Case{"AT+EDFT=7,1", "", "ERROR", ""},
+    Case{"AT+EDFT_BACK=0,5", "", "OK", "", {{kPanel1, "0\n"}}},
+    Case{"AT+EDFT_BACK=0,5", "", "ATOK", kKeepBack + "ok\n" + kLcm + "-e lcm_color W --ei display_id 4096\n",
          {{kPanel1, "1023"}}, back_panel},
-    Case{"BackWhiteAppRefuses", "AT+EDFT_BACK=0,5", "\r\nexit airplane mode failed\r\n", "ATNG",
-         "wakelock acquire 1 ftcmd\nmessage keep_screen_on 1,display_id:4096 -> error\n", {{kPanel1, "0\n"}},
+    Case{"AT+EDFT_BACK=0,5", kAirplane, "ATNG", kKeepBack + "error\n", {{kPanel1, "0\n"}},
          all({back_panel, app_refuses})},
     // In AT mode the system ADC sample is not built: its "Not Implement" makes the line fail.
-    Case{"BackWhiteAtModeResetsAssembly", "AT+EDFT_BACK=0,5", "", "ATNG", "nv write\nfb second blank 1\n", {{kPanel1,
-         "1023"}}, all({at_mode, back_panel}), 0},
-    Case{"BackWhiteAtModeNvWriteFails", "AT+EDFT_BACK=0,5", "", "ATERROR", "", {{kPanel1, "0\n"}}, all({at_mode,
-         back_panel, fault("nv-write")}), 1},
-    Case{"BackWhiteAtModeNvReadFails", "AT+EDFT_BACK=0,5", "", "ATNG", "fb second blank 1\n", {{kPanel1, "1023"}},
-         all({at_mode, back_panel, fault("nv-read")}), 1},
-    Case{"BackOff", "AT+EDFT_BACK=0,0", "", "ATOK",
+    Case{"AT+EDFT_BACK=0,5", "", "ATNG", "nv write\nfb second blank 1\n", {{kPanel1, "1023"}}, back_at_mode, 0},
+    Case{"AT+EDFT_BACK=0,5", "", "ATERROR", "", {{kPanel1, "0\n"}}, all({back_at_mode, fault("nv-write")}), 1},
+    Case{"AT+EDFT_BACK=0,5", "", "ATNG", "fb second blank 1\n", {{kPanel1, "1023"}},
+         all({back_at_mode, fault("nv-read")}), 1},
+    Case{"AT+EDFT_BACK=0,0", "", "ATOK",
          "wakelock release ftcmd\nmessage keep_screen_on 0,display_id:4096 -> ok\n" + kLcm + "\n", {{kPanel1, "0"}},
          back_panel},
-    Case{"BackOffAtMode", "AT+EDFT_BACK=0,0", "", "ATOK", "fb second blank 0\n", {{kPanel1, "0"}}, all({at_mode,
-         back_panel})},
-    Case{"InstantStop", "AT+QX_VBR_STH_TS=0", "", "ATOK", ""},
-    Case{"InstantSameTimes", "AT+QX_VBR_STH_TS=1,500,500", "time invalid", "ATNG", ""},
-    Case{"InstantOnLonger", "AT+QX_VBR_STH_TS=1,600,500", "time invalid", "ATNG", ""},
-    Case{"InstantOneTime", "AT+QX_VBR_STH_TS=1,500", "parameter invalid", "ATNG", ""},
-    Case{"InstantNotNumbers", "AT+QX_VBR_STH_TS=1,a,b", "parameter invalid", "ATNG", ""},
-    Case{"InstantHuge", "AT+QX_VBR_STH_TS=1,5,99999999999", "parameter invalid", "ATNG", ""},
-    Case{"InstantOnAboveTwentySeconds", "AT+QX_VBR_STH_TS=1,25000,100", "time invalid", "ATNG", ""},
-    Case{"InstantOther", "AT+QX_VBR_STH_TS=2", "", "ATERROR", ""},
-    Case{"LedsOff", "AT+MMILED=1,0", "", "OK", "led red/brightness 0\nled green/brightness 0\n"},
-    Case{"LedRed", "AT+MMILED=1,1", "", "OK", "led green/brightness 0\nled red/brightness 255\n"},
-    Case{"LedGreen", "AT+MMILED=1,2", "", "OK", "led red/brightness 0\nled green/brightness 255\n"},
-    Case{"LedGreenEngineering", "AT+MMILED=1,2", "", "OK", "led red/brightness 0\nled green/engineering 255\n", {},
-         engineering},
-    Case{"LedBlue", "AT+MMILED=1,3", "", "OK", "led blue/brightness 255\n"},
-    Case{"LedBlueMissing", "AT+MMILED=1,3", "", "ERROR", "", {}, rm("/sys/class/leds/blue/brightness")},
-    Case{"LedRedMissingLastWriteOk", "AT+MMILED=1,0", "", "OK", "led green/brightness 0\n", {},
-         rm("/sys/class/leds/red/brightness")},
-    Case{"LedCount", "AT+MMILED=2", "\r\n+TYPE:\"3\"\r\n", "OK", ""},
-    Case{"LedCountEngineeringNodeMissing", "AT+MMILED=2", "\r\n+TYPE:\"2\"\r\n", "OK", "", {}, project("RX3310")},
-    Case{"LedOther", "AT+MMILED=3", "", "ERROR", ""},
-    Case{"BlinkStop", "AT+QXLIGHT=0", "", "OK", ""},
-    Case{"BlinkOther", "AT+QXLIGHT=2", "", "ERROR", ""},
-    Case{"RingEffectBlue", "AT+QX_BREATH_LGT=1,B", "", "ATOK", "", {{kEffect, "32"}, {kCfg, "1"}}},
-    Case{"RingEffectGreen", "AT+QX_BREATH_LGT=1,Gx", "", "ATOK", "", {{kEffect, "31"}, {kCfg, "1"}}},
-    Case{"RingEffectH", "AT+QX_BREATH_LGT=1,H", "", "ATOK", "", {{kEffect, "2f"}, {kCfg, "1"}}},
-    Case{"RingEffectRed", "AT+QX_BREATH_LGT=1,R", "", "ATOK", "", {{kEffect, "30"}, {kCfg, "1"}}},
-    Case{"RingEffectOff", "AT+QX_BREATH_LGT=1,0", "", "ATOK", "", {{kEffect, "0"}, {kCfg, "1"}}},
-    Case{"RingEffectLowerCase", "AT+QX_BREATH_LGT=1,b", "\r\n\"param 2 error\"\r\n", "ATERROR", "", {{kEffect, "0\n"}}},
-    Case{"RingEffectMissing", "AT+QX_BREATH_LGT=1", "", "ATERROR", "", {{kEffect, "0\n"}}},
-    Case{"RingEffectOther", "AT+QX_BREATH_LGT=2,B", "", "ATERROR", ""},
-    Case{"RingEffectNoDriver", "AT+QX_BREATH_LGT=1,B", "", "ATNG", "", {{kCfg, "0\n"}}, rm(kEffect)},
-    Case{"RingEffectNoCfg", "AT+QX_BREATH_LGT=1,R", "", "ATNG", "", {{kEffect, "30"}}, rm(kCfg)},
-    Case{"FeedbackOn", "AT+QXCGFK=1", "", "OK", "message feedback 1 -> ok\n"},
-    Case{"FeedbackOffRefused", "AT+QXCGFK=0", "", "ERROR", "message feedback 0 -> error\n", {}, app_refuses},
-    Case{"FeedbackStateOn", "AT+QXCGFK=2", "\r\n\"1\"\r\n", "OK", "message feedback 2 -> ok 1\n", {}, rep("feedback 2",
-         "ok 1")},
-    Case{"FeedbackStateOff", "AT+QXCGFK=2", "\r\n\"0\"\r\n", "OK", "message feedback 2 -> ok 0\n", {},
-         rep("feedback 2", "ok 0")},
-    Case{"FeedbackStateOther", "AT+QXCGFK=2", "", "ERROR", "message feedback 2 -> ok\n"},
-    Case{"FeedbackStateSilent", "AT+QXCGFK=2", "", "ERROR", "message feedback 2 -> (silent)\n", {},
-         fault("testapp-silent")},
-    Case{"FeedbackOther", "AT+QXCGFK=3", "", "ERROR", ""},
-    Case{"BootChinese", "AT+QX_BOOT_SET=1,chinese", "", "ATOK",
-         "setprop persist.sys.lockguide.skip=yes\nmessage setupwizard chinese -> ok\n", {{kInfo, "setupwizard=ZH\n"}}},
-    Case{"BootEnglishRefused", "AT+QX_BOOT_SET=1,english", "", "ATNG",
-         "setprop persist.sys.lockguide.skip=yes\nmessage setupwizard english -> error\n", {{kInfo,
-         "setupwizard=EN\n"}}, app_refuses},
-    Case{"BootEnglishAtMode", "AT+QX_BOOT_SET=1,english", "", "ATOK", "setprop persist.sys.lockguide.skip=yes\n",
-         {{kInfo, "setupwizard=EN\n"}}, at_mode},
-    Case{"BootOther", "AT+QX_BOOT_SET=1,french", "", "ERROR", ""},
-    Case{"RingIcSingleDriver", "AT+QX_RING_IC=0", "\r\n\"a:OK\"\r\n", "ATOK", ""},
-    Case{"RingIcOnlyB", "AT+QX_RING_IC=0", "\r\n\"a:NG,b:OK\"\r\n", "ATOK", "", {}, drivers(false, true)},
-    Case{"RingIcOnlyA", "AT+QX_RING_IC=0", "\r\n\"a:OK,b:NG\"\r\n", "ATOK", "", {}, drivers(true, false)},
-    Case{"RingIcNone", "AT+QX_RING_IC=0", "", "ATNG", "", {}, drivers(false, false)},
-    Case{"RingOff", "AT+QX_RING_LGT=0,0", "", "ATOK", ""},
-    Case{"RingExitLowBattery", "AT+QX_RING_LGT=0,1", "", "ATNG",
-         "message battery_mode set 0,display_id:4096 -> ok\n"
-         "service-start com.zdr.SuperPowerSave/.SuperPowerSaveService "
-         "intent.action.SUPER_POWER_SAVE_SERVICE --es service_action stop\n"},
-    Case{"RingExitLowBatteryRefused", "AT+QX_RING_LGT=0,1", "\r\nexit low bat mode failed\r\n", "ATNG",
-         "message battery_mode set 0,display_id:4096 -> error\n", {}, app_refuses},
-    Case{"RingExitLowBatteryAtMode", "AT+QX_RING_LGT=0,1", "", "ATOK", "", {}, at_mode},
-    Case{"RingColour", "AT+QX_RING_LGT=1,R", "", "ATNG", "message ring_light 1 R,display_id:4096 -> ok\n"},
-    Case{"RingColourRefused", "AT+QX_RING_LGT=2,W", "\r\nring_light failed\r\n", "ATNG",
-         "message ring_light 2 W,display_id:4096 -> error\n", {}, app_refuses},
-    Case{"RingColourTwoChars", "AT+QX_RING_LGT=1,RG", "", "ATERROR", ""},
-    Case{"RingColourMissing", "AT+QX_RING_LGT=2", "", "ATERROR", ""},
-    Case{"RingStop", "AT+QX_RING_LGT=3", "", "ATNG",
-         "message ring_light 0,display_id:4096 -> ok\nsetprop sys.ring_light.cali.para=0\n"},
-    Case{"RingStopRefused", "AT+QX_RING_LGT=3", "\r\nring_light failed\r\n", "ATNG",
-         "message ring_light 0,display_id:4096 -> error\n", {}, app_refuses},
-    Case{"RingMode7", "AT+QX_RING_LGT=6", "", "ATNG", "message ring_light 3,display_id:4096 -> ok\n"},
-    Case{"RingMode3", "AT+QX_RING_LGT=7", "", "ATNG", "message ring_light 4,display_id:4096 -> ok\n"},
-    Case{"RingOther", "AT+QX_RING_LGT=9", "", "ATERROR", ""}),
-    [](const ::testing::TestParamInfo<Case> &info) { return info.param.name; });
+    Case{"AT+EDFT_BACK=0,0", "", "ATOK", "fb second blank 0\n", {{kPanel1, "0"}}, back_at_mode},
+    Case{"AT+QX_VBR_STH_TS=1,500,500", "time invalid", "ATNG", ""},
+    Case{"AT+QX_VBR_STH_TS=1,500", "parameter invalid", "ATNG", ""},
+    Case{"AT+QX_VBR_STH_TS=1,a,b", "parameter invalid", "ATNG", ""},
+    Case{"AT+QX_VBR_STH_TS=1,5,99999999999", "parameter invalid", "ATNG", ""},
+    Case{"AT+QX_VBR_STH_TS=1,25000,100", "time invalid", "ATNG", ""},
+    Case{"AT+QX_VBR_STH_TS=2", "", "ATERROR", ""},
+    Case{"AT+MMILED=1,0", "", "OK", "led red/brightness 0\nled green/brightness 0\n"},
+    Case{"AT+MMILED=1,1", "", "OK", "led green/brightness 0\nled red/brightness 255\n"},
+    Case{"AT+MMILED=1,2", "", "OK", "led red/brightness 0\nled green/brightness 255\n"},
+    Case{"AT+MMILED=1,2", "", "OK", "led red/brightness 0\nled green/engineering 255\n", {}, engineering},
+    Case{"AT+MMILED=1,3", "", "OK", "led blue/brightness 255\n"},
+    Case{"AT+MMILED=1,3", "", "ERROR", "", {}, rm("/sys/class/leds/blue/brightness")},
+    Case{"AT+MMILED=1,0", "", "OK", "led green/brightness 0\n", {}, rm("/sys/class/leds/red/brightness")},
+    Case{"AT+MMILED=2", "\r\n+TYPE:\"3\"\r\n", "OK", ""},
+    Case{"AT+MMILED=2", "\r\n+TYPE:\"2\"\r\n", "OK", "", {}, config("project", "RX3310")},
+    Case{"AT+QX_BREATH_LGT=1,B", "", "ATOK", "", {{kEffect, "32"}, {kCfg, "1"}}},
+    Case{"AT+QX_BREATH_LGT=1,Gx", "", "ATOK", "", {{kEffect, "31"}, {kCfg, "1"}}},
+    Case{"AT+QX_BREATH_LGT=1,H", "", "ATOK", "", {{kEffect, "2f"}, {kCfg, "1"}}},
+    Case{"AT+QX_BREATH_LGT=1,R", "", "ATOK", "", {{kEffect, "30"}, {kCfg, "1"}}},
+    Case{"AT+QX_BREATH_LGT=1,0", "", "ATOK", "", {{kEffect, "0"}, {kCfg, "1"}}},
+    Case{"AT+QX_BREATH_LGT=1,b", "\r\n\"param 2 error\"\r\n", "ATERROR", "", {{kEffect, "0\n"}}},
+    Case{"AT+QX_BREATH_LGT=1", "", "ATERROR", "", {{kEffect, "0\n"}}},
+    Case{"AT+QX_BREATH_LGT=2,B", "", "ATERROR", ""},
+    Case{"AT+QX_BREATH_LGT=1,B", "", "ATNG", "", {{kCfg, "0\n"}}, rm(kEffect)},
+    Case{"AT+QX_BREATH_LGT=1,R", "", "ATNG", "", {{kEffect, "30"}}, rm(kCfg)},
+    Case{"AT+QXCGFK=1", "", "OK", "message feedback 1 -> ok\n"},
+    Case{"AT+QXCGFK=0", "", "ERROR", "message feedback 0 -> error\n", {}, app_refuses},
+    Case{"AT+QXCGFK=2", "\r\n\"1\"\r\n", "OK", "message feedback 2 -> ok 1\n", {}, rep("feedback 2", "ok 1")},
+    Case{"AT+QXCGFK=2", "\r\n\"0\"\r\n", "OK", "message feedback 2 -> ok 0\n", {}, rep("feedback 2", "ok 0")},
+    Case{"AT+QXCGFK=2", "", "ERROR", "message feedback 2 -> ok\n"},
+    Case{"AT+QXCGFK=2", "", "ERROR", "message feedback 2 -> (silent)\n", {}, fault("testapp-silent")},
+    Case{"AT+QX_BOOT_SET=1,chinese", "", "ATOK", kSkip + "message setupwizard chinese -> ok\n",
+         {{kInfo, "setupwizard=ZH\n"}}},
+    Case{"AT+QX_BOOT_SET=1,english", "", "ATNG", kSkip + "message setupwizard english -> error\n",
+         {{kInfo, "setupwizard=EN\n"}}, app_refuses},
+    Case{"AT+QX_BOOT_SET=1,english", "", "ATOK", kSkip, {{kInfo, "setupwizard=EN\n"}}, at_mode},
+    Case{"AT+QX_BOOT_SET=1,french", "", "ERROR", ""},
+    Case{"AT+QX_RING_IC=0", "\r\n\"a:OK\"\r\n", "ATOK", ""},
+    Case{"AT+QX_RING_IC=0", "\r\n\"a:NG,b:OK\"\r\n", "ATOK", "", {}, only_b},
+    Case{"AT+QX_RING_IC=0", "\r\n\"a:OK,b:NG\"\r\n", "ATOK", "", {}, only_a},
+    Case{"AT+QX_RING_IC=0", "", "ATNG", "", {}, rm(kEffect)},
+    Case{"AT+QX_RING_LGT=0,0", "", "ATOK", ""},
+    Case{"AT+QX_RING_LGT=0,1", "", "ATNG", kBatteryMode + "ok\n" + kSaveStop},
+    Case{"AT+QX_RING_LGT=0,1", "\r\nexit low bat mode failed\r\n", "ATNG", kBatteryMode + "error\n", {}, app_refuses},
+    Case{"AT+QX_RING_LGT=0,1", "", "ATOK", "", {}, at_mode},
+    Case{"AT+QX_RING_LGT=1,R", "", "ATNG", ring("1 R")},
+    Case{"AT+QX_RING_LGT=2,W", kRingFailed, "ATNG", ring("2 W", "error"), {}, app_refuses},
+    Case{"AT+QX_RING_LGT=1,RG", "", "ATERROR", ""},
+    Case{"AT+QX_RING_LGT=2", "", "ATERROR", ""},
+    Case{"AT+QX_RING_LGT=3", "", "ATNG", ring("0") + "setprop sys.ring_light.cali.para=0\n"},
+    Case{"AT+QX_RING_LGT=3", kRingFailed, "ATNG", ring("0", "error"), {}, app_refuses},
+    Case{"AT+QX_RING_LGT=6", "", "ATNG", ring("3")},
+    Case{"AT+QX_RING_LGT=7", "", "ATNG", ring("4")},
+    Case{"AT+QX_RING_LGT=9", "", "ATERROR", ""}),
+    named_by([](const Case &c) { return c.line; }));
 
-// One pulse of 10 s, then the worker sleeps; a second start while it runs does nothing.
+// One pulse of 10 s, then the worker sleeps; a second start while it runs does nothing; the stop ends the pulse.
 TEST_F(LightsTest, VibratorPulsesOnceAndRefusesASecondStart) {
     served("AT+EDFT=6,1", "", "OK");
     EXPECT_EQ(details(leds(2)), (std::vector<std::string>{"vibrator/duration 10000", "vibrator/activate 1"}));
@@ -279,8 +254,7 @@ TEST_F(LightsTest, InstantVibrationEndsAfterTwentySeconds) {
     EXPECT_EQ(g_vibrator_run, 0);
 }
 
-// Red on even passes, green on odd ones, both cleared at the start of every pass and at
-// the end; a pass every 500 ms.
+// Red on even passes, green on odd ones, both cleared at the start of every pass and at the end; a pass every 500 ms.
 TEST_F(LightsTest, IndicatorBlinksRedThenGreen) {
     served("AT+QXLIGHT=1", "", "OK");
     served("AT+QXLIGHT=1", "", "OK");
@@ -289,12 +263,12 @@ TEST_F(LightsTest, IndicatorBlinksRedThenGreen) {
     ASSERT_TRUE(wait_workers_done(3000));
     auto ev = leds(0);
     ASSERT_GE(ev.size(), 8u) << box.events();
-    EXPECT_EQ(details(ev, 0, 6), (std::vector<std::string>{"red/brightness 0", "green/brightness 0", "red/brightness 255",
-                                                           "red/brightness 0", "green/brightness 0",
-         "green/brightness 255"}));
+    const std::vector<std::string> clear = {"red/brightness 0", "green/brightness 0"};
+    EXPECT_EQ(details(ev, 0, 3), std::vector<std::string>({clear[0], clear[1], "red/brightness 255"}));
+    EXPECT_EQ(details(ev, 3, 3), std::vector<std::string>({clear[0], clear[1], "green/brightness 255"}));
     EXPECT_GE(ev[3].ms - ev[0].ms, 490);
     EXPECT_LE(ev[3].ms - ev[0].ms, 1200);
-    EXPECT_EQ(details(ev, ev.size() - 2), (std::vector<std::string>{"red/brightness 0", "green/brightness 0"}));
+    EXPECT_EQ(details(ev, ev.size() - 2), clear);
     EXPECT_EQ((ev.size() - 2) % 3, 0u) << box.events();  // whole passes, then the two clears
 }
 

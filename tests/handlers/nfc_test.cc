@@ -1,5 +1,4 @@
-// NFC commands: exact frames, the NCI messages the phone sends to its controller (as the
-// emulated controller records them), the test-app messages, and the 2-second field window.
+// NFC commands: exact frames, the NCI messages the controller got, the test-app messages, the 2-second field window.
 #include <algorithm>
 #include <chrono>
 #include <filesystem>
@@ -98,8 +97,7 @@ protected:
                 out.push_back(e.detail);
         return out;
     }
-    // The controller's record once every open is closed (the device thread records the close
-    // a moment after the daemon's).
+    // The controller's record once every open is closed (the device thread records it a moment later).
     Lines record(bool answers = false) const {
         all_closed();
         return of("nfc", answers);
@@ -111,9 +109,10 @@ protected:
             return std::count(r.begin(), r.end(), "open") == std::count(r.begin(), r.end(), "close");
         }, ms);
     }
-    long long at(const std::string &detail, int nth = 1) const {
+    // When the nth event of kind with this detail was recorded; -1: not (yet).
+    long long at(const std::string &detail, int nth = 1, const char *kind = "nfc") const {
         for (const auto &e : box.event_list())
-            if (e.kind == "nfc" && e.detail == detail && --nth == 0) return e.ms;
+            if (e.kind == kind && e.detail == detail && --nth == 0) return e.ms;
         return -1;
     }
     // No tag or no reader: "timeout 2s" once the 2-second window from the power-up has passed;
@@ -139,7 +138,6 @@ TEST_P(NfcLine, Answers) {
     nfc_script(box, c.script);
     if (c.setup) c.setup(box);
     expect_frame(c.line, c.body, c.word);
-    ASSERT_TRUE(all_closed()) << box.events();
     EXPECT_EQ(record(), c.nfc) << box.events();
     if (c.messages != Lines{"*"}) {
         EXPECT_EQ(of("message"), c.messages);
@@ -152,7 +150,6 @@ INSTANTIATE_TEST_SUITE_P(TestApp, NfcLine, ::testing::Values(
     Case{"On2", "AT+QXNFC=1,2", {}, nullptr, "", "OK", {}, {"nfc_test 2 -> ok"}},
     Case{"On2Silent", "AT+QXNFC=1,2", {}, silent, "", "ATERROR", {}, {"nfc_test 2 -> (silent)"}},
     Case{"Off", "AT+QXNFC=1,0", {}, nullptr, "", "OK", {}, {"nfc_test 0 -> ok"}},
-    Case{"OffRefused", "AT+QXNFC=1,0", {}, refuse, "", "ATERROR", {}},
     Case{"State", "AT+QXNFC=0", {}, rep("nfc_test c", "1"), quoted("1"), "OK", {}},
     Case{"StateError", "AT+QXNFC=0", {}, refuse, "", "ERROR", {}, {"nfc_test c -> error"}},
     Case{"StateSilent", "AT+QXNFC=0", {}, silent, "", "ERROR", {}},
@@ -225,12 +222,10 @@ INSTANTIATE_TEST_SUITE_P(Controller, NfcLine, ::testing::Values(
     Case{"SwpUnknownStatus", "AT+QX_NFC_CHK=0", {"swp=1"}, nullptr, "\"UICC:0;\"", "ATNG", kChk10},
     Case{"SwpRefused", "AT+QX_NFC_CHK=0", {"swp=refused"}, nullptr, "\"UICC:0;\"", "ATNG", kChk10},
     Case{"SelfCheckAbsent", "AT+QX_NFC_CHK=0", {}, absent, "\"UICC:0;\"", "ATNG", {}},
-    Case{"SelfCheckNotReleased", "AT+QX_NFC_CHK=0", {}, silent, "close nfc fail", "ATNG", {}},
     Case{"CardEmulation", "AT+QX_NFC_CARD=0", {"tag=none"}, nullptr, "", "OK", kCard10, {"nfc_test c -> ok"}},
     Case{"CardFieldNotificationFirst", "AT+QX_NFC_CARD=0", {"before=61070101,61070101"}, nullptr, "", "OK", kCard10},
-    Case{"CardAlwaysNci10", "AT+QX_NFC_CARD=0", {}, project("RX6101"), "", "OK", kCard10},
-    Case{"CardAbsent", "AT+QX_NFC_CARD=0", {}, absent, quoted("open nfc error"), "ERROR", {}},
-    Case{"CardNfcOnNotReleased", "AT+QX_NFC_CARD=0", {}, nfc_on_refuses, "close nfc fail", "ERROR", {}}), case_name);
+    Case{"CardAlwaysNci10", "AT+QX_NFC_CARD=0", {}, project("RX6101"), "", "OK", kCard10}), case_name);
+
 
 TEST_F(Nfc, ControllerAnswersAsScripted) {
     nfc_script(box, {"nci=2.0", "firmware=12 02 03 04", "tag=0A1B2C3D"});
@@ -265,12 +260,10 @@ TEST_F(Nfc, SilentControllerIsBounded) {
 TEST_F(Nfc, ReleaseIsPolledTenTimes) {
     box.reply("nfc_test c", "1");
     expect_frame("AT+QX_NFC_IC=1", "close nfc fail", "ATNG");
-    std::vector<long long> polls;
-    for (const auto &e : box.event_list())
-        if (e.kind == "message" && e.detail == "nfc_test c -> 1") polls.push_back(e.ms);
-    ASSERT_EQ(polls.size(), 10u) << box.events();
-    EXPECT_GE(polls.back() - polls.front(), 9 * 200 - 20);
-    EXPECT_LT(polls.back() - polls.front(), 9 * 200 + 600);
+    ASSERT_EQ(of("message"), cat({{"nfc_test 0 -> ok"}, Lines(10, "nfc_test c -> 1")})) << box.events();
+    const long long polled = at("nfc_test c -> 1", 10, "message") - at("nfc_test c -> 1", 1, "message");
+    EXPECT_GE(polled, 9 * 200 - 20);
+    EXPECT_LT(polled, 9 * 200 + 600);
     EXPECT_EQ(record(), Lines{});
 }
 
@@ -285,8 +278,7 @@ TEST_F(Nfc, TagArrivingFromTheStation) {
     station.join();
 }
 
-// Over a real transport: the daemon keeps serving after a silent controller, and the
-// failed writes after the failed read are retried five times each.
+// Over TCP the daemon keeps serving after a silent controller; writes after the failed read are retried five times.
 TEST(NfcDaemon, AnswersOverTcpAndRetriesWrites) {
     Sandbox box;
     nfc_script(box, {"tag=04a1b2c3d4e580"});
