@@ -58,6 +58,12 @@ protected:
         line.copy(buf, kLineSize - 1);
         dispatch_command(buf, static_cast<int>(line.size()), SRC_TCP);
     }
+    // A device or sandbox file ("" removes it), or a property (a key without "/").
+    void give(const std::string &key, const std::string &value) {
+        if (key.find('/') == std::string::npos) box.set_prop(key, value);
+        else if (value.empty()) fs::remove_all(box.path(key));
+        else box.write(key, value);
+    }
     bool wait_workers_gone(int ms = 15000) {
         return wait_until([] { return sampling_workers_alive() == 0; }, ms);
     }
@@ -94,11 +100,9 @@ protected:
 
 struct Case {
     std::string line, tag;
-    Files given;  // device files written before the line ("" value: removed)
+    Files given;  // before the line (see give)
     std::string body, word;
     Files after = {};
-    const char *fault = nullptr;
-    std::string project = "";
 };
 
 void PrintTo(const Case &c, std::ostream *os) { *os << c.line << " " << c.tag; }
@@ -108,12 +112,7 @@ class AdcLine : public AdcBase, public ::testing::WithParamInterface<Case> {};
 // One answer, no streamed line after it, no worker left, no event and the NV record untouched.
 TEST_P(AdcLine, Answers) {
     const Case &c = GetParam();
-    for (const auto &[path, text] : c.given) {
-        if (text.empty()) fs::remove_all(box.path(path));
-        else box.write(path, text);
-    }
-    if (c.fault) box.fault(c.fault);
-    if (!c.project.empty()) box.write("/.sim/config", "project=" + c.project + "\n");
+    for (const auto &[key, value] : c.given) give(key, value);
     expect(c.line, c.body, c.word);
     EXPECT_EQ(answer(1, 0), "");
     EXPECT_EQ(sampling_workers_alive(), 0);
@@ -143,12 +142,12 @@ INSTANTIATE_TEST_SUITE_P(OneShot, AdcLine, ::testing::Values(
     Case{"AT+EADC=3", "NotTested", {}, "\"not Test!\"", "ERROR"},
     Case{"AT+EADC=4", "", {}, "", "OK"},
     Case{"AT+EADC=6", "", {}, "\r\n\"707472429\"\r\n", "OK"},
-    Case{"AT+EADC=6", "NvReadFails", {}, "", "ERROR", {}, "nv-read"},
+    Case{"AT+EADC=6", "NvReadFails", {{"/.sim/faults", "nv-read\n"}}, "", "ERROR"},
     Case{"AT+EADC=7", "", {}, "", "ERROR"},
     Case{"AT+BATADC=1", "NoFastAdapter", {{kAdapter, "0\n"}}, kNotSupported + "0\"\r\n", "ERROR"},
     Case{"AT+BATADC=0", "NoFastAdapter", {{kAdapter, "3\n"}}, kNotSupported + "-22\"\r\n", "ERROR"},
     Case{"AT+BATADC=1", "NoAdapterNode", {{kAdapter, ""}}, kNotSupported + "-22\"\r\n", "ERROR"},
-    Case{"AT+BATADC=0", "OldProject", {{kAdapter, "0\n"}}, "", "OK", {}, nullptr, "RX2101"},
+    Case{"AT+BATADC=0", "OldProject", {{kAdapter, "0\n"}, {"/.sim/config", "project=RX2101\n"}}, "", "OK"},
     Case{"AT+BATADC=0", "Adapter2", {{kAdapter, "2"}}, "", "OK"},
     Case{"AT+BATADC=2", "", {}, "", "ERROR"},
     Case{"AT+QX_ADC_REG=1", "", {}, "\r\n\"305e: 80\n\"\r\n", "ATOK",
@@ -180,7 +179,7 @@ INSTANTIATE_TEST_SUITE_P(VbusForms, AdcLine, ::testing::Values(
 struct Stream {
     std::string name, start;
     int sp;
-    Files given;        // device files, or properties (no "/"), before the start
+    Files given;        // before the start (see give)
     std::string first;  // the first streamed line, whole
     int lines = 1, period_ms = 0;
     // The charge level and the cores (min and max of the big, then max and min of the little
@@ -192,10 +191,7 @@ class Streams : public AdcBase, public ::testing::WithParamInterface<Stream> {};
 TEST_P(Streams, EveryPeriodUntilStopped) {
     const Stream &c = GetParam();
     is_sp = c.sp;
-    for (const auto &[key, value] : c.given) {
-        if (key[0] == '/') box.write(key, value);
-        else box.set_prop(key, value);
-    }
+    for (const auto &[key, value] : c.given) give(key, value);
     const std::string prefix = c.first.substr(0, c.first.find(':') + 1);
     std::vector<Clock::time_point> seen;
     const auto t0 = Clock::now();
