@@ -64,11 +64,16 @@ protected:
         InProcess::TearDown();
     }
     void give(const std::string &key, const std::string &value) {
-        if (key.find('/') == std::string::npos) return box.set_prop(key, value);
-        if (value == kGone || value == kDir) fs::remove_all(box.path(key));
-        if (value == kDir) fs::create_directories(box.path(key));
-        else if (value.find('|') != std::string::npos) box.sequence(key, split(value, '|'));
-        else if (value != kGone) box.write(key, value);
+        if (key.find('/') == std::string::npos) {
+            box.set_prop(key, value);
+        } else if (value == kGone || value == kDir) {
+            fs::remove_all(box.path(key));
+            if (value == kDir) fs::create_directories(box.path(key));
+        } else if (value.find('|') != std::string::npos) {
+            box.sequence(key, split(value, '|'));
+        } else {
+            box.write(key, value);
+        }
     }
 };
 
