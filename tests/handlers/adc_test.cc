@@ -4,7 +4,6 @@
 #include <chrono>
 #include <cstring>
 #include <filesystem>
-#include <thread>
 
 #include "core/nv.h"
 #include "handlers/adc.h"
