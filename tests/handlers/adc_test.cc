@@ -4,7 +4,6 @@
 #include <chrono>
 #include <cstring>
 #include <filesystem>
-#include <thread>
 
 #include "core/nv.h"
 #include "handlers/adc.h"
@@ -58,6 +57,12 @@ protected:
         line.copy(buf, kLineSize - 1);
         dispatch_command(buf, static_cast<int>(line.size()), SRC_TCP);
     }
+    // A device or sandbox file ("" removes it), or a property (a key without "/").
+    void give(const std::string &key, const std::string &value) {
+        if (key.find('/') == std::string::npos) box.set_prop(key, value);
+        else if (value.empty()) fs::remove_all(box.path(key));
+        else box.write(key, value);
+    }
     bool wait_workers_gone(int ms = 15000) {
         return wait_until([] { return sampling_workers_alive() == 0; }, ms);
     }
@@ -93,32 +98,25 @@ protected:
 };
 
 struct Case {
-    std::string line, tag = "";
-    Files given = {};  // device files written before the line ("" value: removed)
-    const char *fault = nullptr;
-    std::string project = "";
+    std::string line, tag;
+    Files given;  // before the line (see give)
     std::string body, word;
     Files after = {};
-    std::string events = "";
 };
 
 void PrintTo(const Case &c, std::ostream *os) { *os << c.line << " " << c.tag; }
 
 class AdcLine : public AdcBase, public ::testing::WithParamInterface<Case> {};
 
+// One answer, no streamed line after it, no worker left, no event and the NV record untouched.
 TEST_P(AdcLine, Answers) {
     const Case &c = GetParam();
-    for (const auto &[path, text] : c.given) {
-        if (text.empty()) fs::remove_all(box.path(path));
-        else box.write(path, text);
-    }
-    if (c.fault) box.fault(c.fault);
-    if (!c.project.empty()) box.write("/.sim/config", "project=" + c.project + "\n");
+    for (const auto &[key, value] : c.given) give(key, value);
     expect(c.line, c.body, c.word);
     EXPECT_EQ(answer(1, 0), "");
     EXPECT_EQ(sampling_workers_alive(), 0);
     for (const auto &[path, text] : c.after) EXPECT_EQ(box.read(path), text) << path;
-    EXPECT_EQ(box.events(), c.events);
+    EXPECT_EQ(box.events(), "");
     EXPECT_EQ(box.read("/.sim/nv.bin"), nv_pattern());
 }
 
@@ -129,125 +127,113 @@ std::string name_of(const ::testing::TestParamInfo<Case> &info) {
 const std::string kAcAvg = "/sys/class/power_supply/cms/current_ac_avg_now";
 const std::string kLastCurrent = "/cache/recovery/last_ChargeCurrent";
 const std::string kNotSupported = "\r\n\"current not supported_adapter: ";
+const std::string kNoCount = "\"write /d/regmap/spmi0-00/count error:No such file or directory\"";
 
 // clang-format off
 INSTANTIATE_TEST_SUITE_P(OneShot, AdcLine, ::testing::Values(
-    Case{.line = "AT+EADC=0", .tag = "NotRunning", .word = "OK"},
-    Case{.line = "AT+EADC=2", .body = "\"1.48\"", .word = "OK"},
-    Case{.line = "AT+EADC=2", .tag = "Negative", .given = {{kAcAvg, "-1235\n"}}, .body = "\"-1.24\"", .word = "OK"},
-    Case{.line = "AT+EADC=2", .tag = "NoNode", .given = {{kAcAvg, ""}}, .word = "ERROR"},
-    Case{.line = "AT+EADC=3", .given = {{kLastCurrent, "1500mA\n"}}, .body = "\r\n\"1500mA\n\"\r\n", .word = "OK"},
-    Case{.line = "AT+EADC=3", .tag = "Cut", .given = {{kLastCurrent, std::string(40, '7')}},
-         .body = "\r\n\"" + std::string(30, '7') + "\"\r\n", .word = "OK"},
-    Case{.line = "AT+EADC=3", .tag = "OneCharacter", .given = {{kLastCurrent, "7"}}, .body = "\"not Test!\"", .word = "ERROR"},
-    Case{.line = "AT+EADC=3", .tag = "NotTested", .body = "\"not Test!\"", .word = "ERROR"},
-    Case{.line = "AT+EADC=4", .word = "OK"},
-    Case{.line = "AT+EADC=6", .body = "\r\n\"707472429\"\r\n", .word = "OK"},
-    Case{.line = "AT+EADC=6", .tag = "NvReadFails", .fault = "nv-read", .word = "ERROR"},
-    Case{.line = "AT+EADC=7", .word = "ERROR"},
-    Case{.line = "AT+BATADC=1", .tag = "NoFastAdapter", .given = {{kAdapter, "0\n"}}, .body = kNotSupported + "0\"\r\n",
-         .word = "ERROR"},
-    Case{.line = "AT+BATADC=0", .tag = "NoFastAdapter", .given = {{kAdapter, "3\n"}}, .body = kNotSupported + "-22\"\r\n",
-         .word = "ERROR"},
-    Case{.line = "AT+BATADC=1", .tag = "NoAdapterNode", .given = {{kAdapter, ""}}, .body = kNotSupported + "-22\"\r\n",
-         .word = "ERROR"},
-    Case{.line = "AT+BATADC=0", .tag = "OldProject", .given = {{kAdapter, "0\n"}}, .project = "RX2101", .word = "OK"},
-    Case{.line = "AT+BATADC=0", .tag = "Adapter2", .given = {{kAdapter, "2"}}, .word = "OK"},
-    Case{.line = "AT+BATADC=2", .word = "ERROR"},
-    Case{.line = "AT+QX_ADC_REG=1", .body = "\r\n\"305e: 80\n\"\r\n", .word = "ATOK",
-         .after = {{kRegmap + "count", "1"}, {kRegmap + "address", "0x305e"}}},
-    Case{.line = "AT+QX_ADC_REG=1", .tag = "NoCount", .given = {{kRegmap + "count", ""}},
-         .body = "\"write /d/regmap/spmi0-00/count error:No such file or directory\"", .word = "ATNG"},
-    Case{.line = "AT+QX_ADC_REG=1", .tag = "DataUnreadable", .given = {{kRegmap + "data", ""}, {kRegmap + "data/x", "x"}},
-         .word = "ATNG"},
-    Case{.line = "AT+QX_ADC_REG=1", .tag = "TableEdited", .given = {{"/.sim/pmic_registers", "0x305e=0x3c\n"}},
-         .body = "\r\n\"305e: 3c\n\"\r\n", .word = "ATOK"},
-    Case{.line = "AT+QX_ADC_REG=0", .word = "ATERROR", .after = {{kRegmap + "address", "0x305e\n"}}}),
+    Case{"AT+EADC=0", "NotRunning", {}, "", "OK"},
+    Case{"AT+EADC=2", "", {}, "\"1.48\"", "OK"},
+    Case{"AT+EADC=2", "Negative", {{kAcAvg, "-1235\n"}}, "\"-1.24\"", "OK"},
+    Case{"AT+EADC=2", "NoNode", {{kAcAvg, ""}}, "", "ERROR"},
+    Case{"AT+EADC=3", "", {{kLastCurrent, "1500mA\n"}}, "\r\n\"1500mA\n\"\r\n", "OK"},
+    Case{"AT+EADC=3", "Cut", {{kLastCurrent, std::string(40, '7')}}, "\r\n\"" + std::string(30, '7') + "\"\r\n", "OK"},
+    Case{"AT+EADC=3", "OneCharacter", {{kLastCurrent, "7"}}, "\"not Test!\"", "ERROR"},
+    Case{"AT+EADC=3", "NotTested", {}, "\"not Test!\"", "ERROR"},
+    Case{"AT+EADC=4", "", {}, "", "OK"},
+    Case{"AT+EADC=6", "", {}, "\r\n\"707472429\"\r\n", "OK"},
+    Case{"AT+EADC=6", "NvReadFails", {{"/.sim/faults", "nv-read\n"}}, "", "ERROR"},
+    Case{"AT+EADC=7", "", {}, "", "ERROR"},
+    Case{"AT+BATADC=1", "NoFastAdapter", {{kAdapter, "0\n"}}, kNotSupported + "0\"\r\n", "ERROR"},
+    Case{"AT+BATADC=0", "NoFastAdapter", {{kAdapter, "3\n"}}, kNotSupported + "-22\"\r\n", "ERROR"},
+    Case{"AT+BATADC=1", "NoAdapterNode", {{kAdapter, ""}}, kNotSupported + "-22\"\r\n", "ERROR"},
+    Case{"AT+BATADC=0", "OldProject", {{kAdapter, "0\n"}, {"/.sim/config", "project=RX2101\n"}}, "", "OK"},
+    Case{"AT+BATADC=0", "Adapter2", {{kAdapter, "2"}}, "", "OK"},
+    Case{"AT+BATADC=2", "", {}, "", "ERROR"},
+    Case{"AT+QX_ADC_REG=1", "", {}, "\r\n\"305e: 80\n\"\r\n", "ATOK",
+         {{kRegmap + "count", "1"}, {kRegmap + "address", "0x305e"}}},
+    Case{"AT+QX_ADC_REG=1", "NoCount", {{kRegmap + "count", ""}}, kNoCount, "ATNG"},
+    Case{"AT+QX_ADC_REG=1", "DataUnreadable", {{kRegmap + "data", ""}, {kRegmap + "data/x", "x"}}, "", "ATNG"},
+    Case{"AT+QX_ADC_REG=1", "TableEdited", {{"/.sim/pmic_registers", "0x305e=0x3c\n"}}, "\r\n\"305e: 3c\n\"\r\n",
+         "ATOK"},
+    Case{"AT+QX_ADC_REG=0", "", {}, "", "ATERROR", {{kRegmap + "address", "0x305e\n"}}}),
     name_of);
 
+const std::string kRange = "\"range error\"";
+
 INSTANTIATE_TEST_SUITE_P(VbusForms, AdcLine, ::testing::Values(
-    Case{.line = "AT+QX_VBUS_VOLT=0,1,2", .tag = "TwoFields", .body = "\"parameter error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,1,x,3", .body = "\"digitValue error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,10001,0,1", .body = "\"range error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,0,0,0", .body = "\"range error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,0,0,101", .body = "\"range error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=0,0,0,99999999999999999999", .tag = "Absurd", .body = "\"range error\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=1", .tag = "NeverRun", .body = "\"\"", .word = "ATNG"},
-    Case{.line = "AT+QX_VBUS_VOLT=1", .tag = "Stored", .given = {{kTestInfo, "usb_voltage=5012,4990,5001\n"}},
-         .body = "\"5012,4990,5001\"", .word = "ATOK"},
-    Case{.line = "AT+QX_VBUS_VOLT=2", .word = "ATERROR"}),
+    Case{"AT+QX_VBUS_VOLT=0,1,2", "TwoFields", {}, "\"parameter error\"", "ATNG"},
+    Case{"AT+QX_VBUS_VOLT=0,1,x,3", "", {}, "\"digitValue error\"", "ATNG"},
+    Case{"AT+QX_VBUS_VOLT=0,10001,0,1", "", {}, kRange, "ATNG"},
+    Case{"AT+QX_VBUS_VOLT=0,0,0,0", "", {}, kRange, "ATNG"},
+    Case{"AT+QX_VBUS_VOLT=0,0,0,101", "", {}, kRange, "ATNG"},
+    Case{"AT+QX_VBUS_VOLT=0,0,0,99999999999999999999", "Absurd", {}, kRange, "ATNG"},
+    Case{"AT+QX_VBUS_VOLT=1", "NeverRun", {}, "\"\"", "ATNG"},
+    Case{"AT+QX_VBUS_VOLT=1", "Stored", {{kTestInfo, "usb_voltage=5012,4990,5001\n"}}, "\"5012,4990,5001\"", "ATOK"},
+    Case{"AT+QX_VBUS_VOLT=2", "", {}, "", "ATERROR"}),
     name_of);
 // clang-format on
 
-// ---- EADC stream
+// ---- streams: the first line after the answer, then one per period until the stop form
 
-struct EadcCase {
-    std::string name;
+struct Stream {
+    std::string name, start;
     int sp;
-    std::string volt, temp, current, line;
+    Files given;        // before the start (see give)
+    std::string first;  // the first streamed line, whole
+    int lines = 1, period_ms = 0;
+    // The charge level and the cores (min and max of the big, then max and min of the little
+    // ones) while it streams and after the stop; with them, nothing may follow the stop.
+    std::string during = "", after = "";
 };
+class Streams : public AdcBase, public ::testing::WithParamInterface<Stream> {};
 
-class EadcFigures : public AdcBase, public ::testing::WithParamInterface<EadcCase> {};
-
-TEST_P(EadcFigures, FirstLineAfterTheAnswer) {
-    const EadcCase &c = GetParam();
+TEST_P(Streams, EveryPeriodUntilStopped) {
+    const Stream &c = GetParam();
     is_sp = c.sp;
-    box.write(kBattery + "voltage_now", c.volt + "\n");
-    if (!c.temp.empty()) box.write(kBattery + "temp", c.temp + "\n");
-    if (!c.current.empty()) box.write(kBattery + "current_now", c.current + "\n");
-    send("AT+EADC=1");
-    const std::string answer = "AT+EADC=1\r\n\r\nOK\r\n";
-    std::string got = until(c.line);
-    ASSERT_EQ(got.substr(0, answer.size() + c.line.size()), answer + c.line);
+    for (const auto &[key, value] : c.given) give(key, value);
+    const std::string prefix = c.first.substr(0, c.first.find(':') + 1);
+    std::vector<Clock::time_point> seen;
+    const auto t0 = Clock::now();
+    send(c.start);
+    const std::string got = until(prefix, c.lines, 8000, &seen), answered = c.start + "\r\n\r\nOK\r\n" + c.first;
+    ASSERT_EQ(seen.size(), static_cast<size_t>(c.lines)) << got;
+    EXPECT_EQ(got.substr(0, answered.size()), answered);
+    EXPECT_GE(ms_between(t0, seen.back()), (c.lines - 1) * c.period_ms - 20);  // late on a busy machine, never early
+    EXPECT_EQ(sampling_workers_alive(), 1);
+    if (c.after.empty()) return;
+    EXPECT_EQ(box.read(kSoc) + "|" + cores(), c.during);
+    const std::string stop = c.start.substr(0, c.start.size() - 1) + "0", stopped = frame(stop, "", "OK");
+    send(stop);
+    EXPECT_NE(until(stopped).find(stopped), std::string::npos);
+    ASSERT_TRUE(wait_workers_gone(3000));
+    EXPECT_EQ(box.read(kSoc) + "|" + cores(), c.after);
+    read_some(station, 4096, 100);                    // a line the worker was writing as it stopped
+    EXPECT_EQ(until(prefix, 1, 700), "") << c.name;  // and nothing after it ended
 }
 
+const std::string kVolt = kBattery + "voltage_now", kTemp = kBattery + "temp", kCurrent = kBattery + "current_now";
+const std::string kRest = ",30.10,0.58,-412.00,4.50\"\r\n", kLine = "+EADC: \"4.12" + kRest;
+const std::string kFigures = "+EADC: \"4.12,25.30,0.58,", kFactory = "persist.sys.factory.mode";
+const std::string kUntouched = "0\n|2\n,4\n,4\n,1\n";
+
 // clang-format off
-INSTANTIATE_TEST_SUITE_P(Eadc, EadcFigures, ::testing::Values(
-    EadcCase{"TemperatureTenths", 0, "4123000", "253", "1500", "+EADC: \"4.12,25.30,0.58,1.50,4.50\"\r\n"},
-    EadcCase{"SinglePrecisionVolts", 0, "3835000", "", "", "+EADC: \"3.84,30.10,0.58,-412.00,4.50\"\r\n"},
-    EadcCase{"LowVoltsShownInPlainMode", 0, "3600000", "", "", "+EADC: \"3.60,30.10,0.58,-412.00,4.50\"\r\n"},
-    EadcCase{"AtModeLowVoltsRaised", 1, "3600000", "", "", "+EADC: \"3.83,30.10,0.58,-412.00,4.50\"\r\n"},
-    EadcCase{"AtModeJustBelowFull", 1, "3790000", "", "", "+EADC: \"3.82,30.10,0.58,-412.00,4.50\"\r\n"},
-    EadcCase{"AtModeAtFullUnchanged", 1, "3800000", "", "", "+EADC: \"3.80,30.10,0.58,-412.00,4.50\"\r\n"},
-    EadcCase{"AtModeJustAboveLowEdge", 1, "3500001", "", "", "+EADC: \"3.78,30.10,0.58,-412.00,4.50\"\r\n"},
-    EadcCase{"LongLineCutAt49", 0, "4123000", "2000000000", "-2000000000",
-             "+EADC: \"4.12,200000000.00,0.58,-2000000.00,4.50\"\r"}),
-    [](const ::testing::TestParamInfo<EadcCase> &i) { return i.param.name; });
+INSTANTIATE_TEST_SUITE_P(Adc, Streams, ::testing::Values(
+    Stream{"EadcInFactory", "AT+EADC=1", 0, {{kFactory, "yes"}}, kLine, 5, 300, "100|0,0,1,1", "70|2,4,4,1"},
+    Stream{"EadcInAtMode", "AT+EADC=1", 1, {}, kLine, 2, 300, kUntouched, kUntouched},
+    Stream{"Batadc", "AT+BATADC=1", 0, {}, "+BATADC: \"612\"\r\n", 6, 200, kUntouched, kUntouched},
+    Stream{"TemperatureTenths", "AT+EADC=1", 0, {{kTemp, "253\n"}, {kCurrent, "1500\n"}}, kFigures + "1.50,4.50\"\r\n"},
+    Stream{"SinglePrecisionVolts", "AT+EADC=1", 0, {{kVolt, "3835000\n"}}, "+EADC: \"3.84" + kRest},
+    Stream{"LowVoltsShownInPlainMode", "AT+EADC=1", 0, {{kVolt, "3600000\n"}}, "+EADC: \"3.60" + kRest},
+    Stream{"AtModeLowVoltsRaised", "AT+EADC=1", 1, {{kVolt, "3600000\n"}}, "+EADC: \"3.83" + kRest},
+    Stream{"AtModeJustBelowFull", "AT+EADC=1", 1, {{kVolt, "3790000\n"}}, "+EADC: \"3.82" + kRest},
+    Stream{"AtModeAtFullUnchanged", "AT+EADC=1", 1, {{kVolt, "3800000\n"}}, "+EADC: \"3.80" + kRest},
+    Stream{"AtModeJustAboveLowEdge", "AT+EADC=1", 1, {{kVolt, "3500001\n"}}, "+EADC: \"3.78" + kRest},
+    Stream{"LongLineCutAt49", "AT+EADC=1", 0, {{kTemp, "2000000000\n"}, {kCurrent, "-2000000000\n"}},
+           "+EADC: \"4.12,200000000.00,0.58,-2000000.00,4.50\"\r"}),
+    [](const ::testing::TestParamInfo<Stream> &i) { return i.param.name; });
 // clang-format on
 
 class Eadc : public AdcBase {};
-
-TEST_F(Eadc, StreamsEvery300msWithCoresLimitedAndRestoresOnStop) {
-    box.set_prop("persist.sys.factory.mode", "yes");
-    std::vector<Clock::time_point> seen;
-    const auto t0 = Clock::now();
-    send("AT+EADC=1");
-    std::string got = until("+EADC:", 5, 8000, &seen);
-    ASSERT_EQ(seen.size(), 5u) << got;
-    // Lines can arrive late on a busy machine, never early: the fifth is 4 periods out.
-    EXPECT_GE(ms_between(t0, seen[4]), 4 * 300 - 20);
-    EXPECT_EQ(box.read(kSoc), "100");
-    EXPECT_EQ(cores(), "0,0,1,1");
-    EXPECT_EQ(sampling_workers_alive(), 1);
-
-    send("AT+EADC=0");
-    EXPECT_NE(until("AT+EADC=0\r\n\r\nOK\r\n").find("AT+EADC=0\r\n\r\nOK\r\n"), std::string::npos);
-    ASSERT_TRUE(wait_workers_gone(3000));
-    EXPECT_EQ(box.read(kSoc), "70");
-    EXPECT_EQ(cores(), "2,4,4,1");
-    read_some(station, 4096, 100);           // a line the worker was writing as it stopped
-    EXPECT_EQ(until("+EADC:", 1, 700), "");  // and nothing after it ended
-}
-
-TEST_F(Eadc, AtModeLeavesCoresAndChargeLevelAlone) {
-    is_sp = 1;
-    send("AT+EADC=1");
-    until("+EADC:");
-    send("AT+EADC=0");
-    ASSERT_TRUE(wait_workers_gone(3000));
-    EXPECT_EQ(box.read(kSoc), "0\n");  // not in factory mode
-    EXPECT_EQ(cores(), "2\n,4\n,4\n,1\n");  // never written
-}
 
 TEST_F(Eadc, SecondStartAddsNoWorkerButARestartWithinAPeriodDoes) {
     send("AT+EADC=1");
@@ -278,19 +264,6 @@ TEST_F(Eadc, UnreadableNodeEndsTheStreamAndClearsTheFlag) {
 
 class Batadc : public AdcBase {};
 
-TEST_F(Batadc, StreamsEvery200msUntilStopped) {
-    std::vector<Clock::time_point> seen;
-    const auto t0 = Clock::now();
-    send("AT+BATADC=1");
-    std::string got = until("+BATADC:", 6, 8000, &seen);
-    ASSERT_EQ(seen.size(), 6u) << got;
-    const std::string first = "AT+BATADC=1\r\n\r\nOK\r\n+BATADC: \"612\"\r\n";
-    EXPECT_EQ(got.substr(0, first.size()), first);
-    EXPECT_GE(ms_between(t0, seen[5]), 5 * 200 - 20);
-    send("AT+BATADC=0");
-    ASSERT_TRUE(wait_workers_gone(3000));
-}
-
 TEST_F(Batadc, MissingNodeEndsTheWorkerButKeepsItMarkedRunning) {
     fs::remove(box.path(kBatTemp));
     send("AT+BATADC=1");
@@ -304,77 +277,54 @@ TEST_F(Batadc, MissingNodeEndsTheWorkerButKeepsItMarkedRunning) {
     EXPECT_NE(until("+BATADC: \"640\"\r\n").find("+BATADC: \"640\"\r\n"), std::string::npos);
 }
 
-// ---- VBUS worker
+// ---- VBUS worker: the start wait (cut short by an unplug), the samples, the stored max,min,average
 
-class Vbus : public AdcBase {
-protected:
-    std::string stored() {
-        std::string v;
-        sim::read_kv(box.path(kTestInfo), "usb_voltage", v);
-        return v;
-    }
+struct VbusRun {
+    std::string name, line;
+    std::vector<std::string> online, microvolts;  // one value per read (none: the node as it is)
+    std::string during, body, word;               // a line served while the worker runs
+    long min_ms, max_ms;                          // how long the worker ran (0: no bound)
+    std::string stored;
 };
+class Vbus : public AdcBase, public ::testing::WithParamInterface<VbusRun> {};
 
-TEST_F(Vbus, CableOutSamplesAfterTheDelayAndStoresMaxMinAverage) {
-    box.write(kOnline, "0\n");
-    box.write("/sys/class/power_supply/usb/voltage_now", "5012999\n");
+TEST_P(Vbus, SamplesAndStores) {
+    const VbusRun &c = GetParam();
+    box.sequence(kOnline, c.online);
+    box.sequence("/sys/class/power_supply/usb/voltage_now", c.microvolts);
     const auto t0 = Clock::now();
-    expect("AT+QX_VBUS_VOLT=0,300,50,3", "", "ATOK");
-    EXPECT_EQ(stored(), "null");
-    expect("AT+QX_VBUS_VOLT=0,0,0,1", "\"vbus_reading\"", "ATNG");
-    ASSERT_TRUE(wait_workers_gone(5000));
-    EXPECT_GE(ms_between(t0, Clock::now()), 300 + 3 * 50);
-    EXPECT_EQ(stored(), "5012,5012,5012");
-    expect("AT+QX_VBUS_VOLT=1", "\"5012,5012,5012\"", "ATOK");
+    expect(c.line, "", "ATOK");
+    if (!c.during.empty()) expect(c.during, c.body, c.word);
+    ASSERT_TRUE(wait_workers_gone(8000));
+    const long ms = ms_between(t0, Clock::now());
+    EXPECT_GE(ms, c.min_ms);
+    if (c.max_ms) {
+        EXPECT_LT(ms, c.max_ms);
+    }
+    std::string stored;
+    sim::read_kv(box.path(kTestInfo), "usb_voltage", stored);
+    EXPECT_EQ(stored, c.stored);  // "null" from the start until a whole run stores its figures
     EXPECT_EQ(box.events(), "shell /system/bin/sh -c \"chmod 664 /sys/class/power_supply/usb/online\"\n");
 }
 
-TEST_F(Vbus, StopDuringTheRunStoresNothing) {
-    box.write(kOnline, "0\n");
-    expect("AT+QX_VBUS_VOLT=0,10,1500,5", "", "ATOK");
-    expect("AT+QX_VBUS_VOLT=1", "\"null\"", "ATNG");
-    ASSERT_TRUE(wait_workers_gone(5000));
-    EXPECT_EQ(stored(), "null");
-}
-
-struct SeriesCase {
-    std::string name;
-    std::vector<std::string> microvolts;
-    std::string stored;
-};
-
-class VbusSeries : public Vbus, public ::testing::WithParamInterface<SeriesCase> {};
-
-TEST_P(VbusSeries, StoresMaxMinAverageInMillivolts) {
-    const SeriesCase &c = GetParam();
-    box.write(kOnline, "0\n");
-    box.sequence("/sys/class/power_supply/usb/voltage_now", c.microvolts);
-    const std::string line = "AT+QX_VBUS_VOLT=0,0,10," + std::to_string(c.microvolts.size());
-    expect(line, "", "ATOK");
-    ASSERT_TRUE(wait_workers_gone(5000));
-    EXPECT_EQ(stored(), c.stored);
-    expect("AT+QX_VBUS_VOLT=1", "\"" + c.stored + "\"", "ATOK");
-}
+const std::string kBusy = "AT+QX_VBUS_VOLT=0,0,0,1";
 
 // clang-format off
-INSTANTIATE_TEST_SUITE_P(Vbus, VbusSeries, ::testing::Values(
-    SeriesCase{"Replug", {"5000999", "5100000", "4899999", "-1500"}, "5100,-1,3749"},
-    SeriesCase{"TruncatedTowardZero", {"4999", "-999"}, "4,0,2"},
-    SeriesCase{"MaximumNeverBelowZero", {"-2500", "-1999"}, "0,-2,-1"},
-    SeriesCase{"OneSample", {"5012000"}, "5012,5012,5012"}),
-    [](const ::testing::TestParamInfo<SeriesCase> &i) { return i.param.name; });
+INSTANTIATE_TEST_SUITE_P(Runs, Vbus, ::testing::Values(
+    VbusRun{"CableOut", "AT+QX_VBUS_VOLT=0,300,50,3", {"0"}, {"5012999"}, kBusy, "\"vbus_reading\"", "ATNG", 450, 0,
+            "5012,5012,5012"},
+    VbusRun{"ReadStops", "AT+QX_VBUS_VOLT=0,10,1500,5", {"0"}, {}, "AT+QX_VBUS_VOLT=1", "\"null\"", "ATNG", 0, 0,
+            "null"},
+    // Two whole-second checks, the second seeing the cable out, well before the 5 s start delay.
+    VbusRun{"UnplugEndsStartWait", "AT+QX_VBUS_VOLT=0,5000,0,1", {"1", "1", "0"}, {}, "", "", "", 2000, 4500,
+            "5012,5012,5012"},
+    VbusRun{"Replug", "AT+QX_VBUS_VOLT=0,0,10,4", {"0"}, {"5000999", "5100000", "4899999", "-1500"}, "", "", "", 0, 0,
+            "5100,-1,3749"},
+    VbusRun{"TruncatedTowardZero", "AT+QX_VBUS_VOLT=0,0,10,2", {"0"}, {"4999", "-999"}, "", "", "", 0, 0, "4,0,2"},
+    VbusRun{"MaximumNeverBelowZero", "AT+QX_VBUS_VOLT=0,0,10,2", {"0"}, {"-2500", "-1999"}, "", "", "", 0, 0,
+            "0,-2,-1"}),
+    [](const ::testing::TestParamInfo<VbusRun> &i) { return i.param.name; });
 // clang-format on
-
-TEST_F(Vbus, UnplugEndsTheStartWaitEarly) {
-    box.sequence(kOnline, {"1", "1", "0"});
-    const auto t0 = Clock::now();
-    expect("AT+QX_VBUS_VOLT=0,5000,0,1", "", "ATOK");
-    ASSERT_TRUE(wait_workers_gone(8000));
-    const long ms = ms_between(t0, Clock::now());
-    EXPECT_GE(ms, 2000);  // two whole-second checks, the second seeing the cable out
-    EXPECT_LT(ms, 4500);  // well before the 5 s start delay
-    EXPECT_EQ(stored(), "5012,5012,5012");
-}
 
 // ---- thermal-zone filter and register table
 

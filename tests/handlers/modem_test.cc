@@ -13,10 +13,12 @@ std::string with_i32(std::string nv, size_t off, int32_t v) { return nv.replace(
 struct Case {
     const char *name;
     std::string line;
-    std::vector<std::string> script;  // modem script lines; "project=..." and "fault=..." set those instead
+    // modem script lines; "project=", "fault=" and "adb=" (the NV debug-port field) set those instead
+    std::vector<std::string> script;
     std::string body;
     const char *word;
-    std::vector<std::string> records;  // modem, rf and service records, exactly, in order
+    std::vector<std::string> records;  // modem, rf, service and NV records, exactly, in order
+    const char *dpdt = "";             // persist.sys.dpdt afterwards
 };
 
 std::vector<std::string> rf_records(const std::string &log) {
@@ -28,35 +30,37 @@ std::vector<std::string> rf_records(const std::string &log) {
     return out;
 }
 
-class Modem : public InProcess {
+class ModemLine : public InProcess, public ::testing::WithParamInterface<Case> {
 protected:
     void SetUp() override {
         InProcess::SetUp();
         box.write("/.sim/nv.bin", nv_pattern());
         box.write("/.sim/events.log", "");
     }
-    void served(const std::string &line, const std::string &body, const std::string &word) {
-        const std::string want = frame(line, body, word);
-        EXPECT_EQ(serve(line, SRC_TCP, want.size()), want);
-    }
 };
-class ModemLine : public Modem, public ::testing::WithParamInterface<Case> {};
 
 TEST_P(ModemLine, Answers) {
     const Case &c = GetParam();
-    std::string script;
+    std::string script, nv = nv_pattern();
     for (const auto &l : c.script) {
         if (l.starts_with("project=")) box.write("/.sim/config", l + "\n" + box.read("/.sim/config"));
         else if (l.starts_with("fault=")) box.fault(l.substr(6));
+        else if (l.starts_with("adb=")) box.write("/.sim/nv.bin", nv = with_i32(nv, 12, std::stoi(l.substr(4))));
         else script += l + "\n";
     }
     box.write("/.sim/modem", script + box.read("/.sim/modem"));
-    served(c.line, c.body, c.word);
-    EXPECT_EQ(rf_records(box.events()), c.records);
-    EXPECT_EQ(box.read("/.sim/nv.bin"), nv_pattern());
+    const std::string want = frame(c.line, c.body, c.word);
+    EXPECT_EQ(serve(c.line, SRC_TCP, want.size()), want);
+    const auto records = rf_records(box.events());
+    EXPECT_EQ(records, c.records);
+    // The only NV write sets the DPDT service flag.
+    const bool wrote = !records.empty() && records[0] == "nv write";
+    EXPECT_EQ(box.read("/.sim/nv.bin"), wrote ? with_i32(nv, 104, 1) : nv);
+    EXPECT_EQ(box.prop("persist.sys.dpdt"), c.dpdt);
 }
 
 const std::string kEm = "modem em_status ";
+const std::string kService = "service-start com.pyxa.engineermode/.DpdtService  ";
 const auto by_name = [](const auto &i) { return std::string(i.param.name); };
 
 INSTANTIATE_TEST_SUITE_P(Dpdt, ModemLine, ::testing::Values(
@@ -67,10 +71,10 @@ INSTANTIATE_TEST_SUITE_P(Dpdt, ModemLine, ::testing::Values(
     Case{"MainProjectRefused", "AT+QXDPDT=0", {"em.122=2", "project=RX5280F_EX"}, "", "ATNG", {kEm + "122 -> 2"}},
     Case{"Diversity", "AT+QXDPDT=1", {}, "", "OK", {kEm + "111 -> 0"}},
     Case{"DiversityProjectRefused", "AT+QXDPDT=1", {"em.121=x", "project=RX5280F_EX"}, "", "ATNG", {kEm + "121 -> x"}},
-    Case{"CrossOnOtherProjects", "AT+QXDPDT=2", {}, "", "OK", {"rf dpdt cross"}},
-    Case{"NormalOnRx6105", "AT+QXDPDT=2", {"project=RX6105"}, "", "OK", {"rf dpdt normal"}},
-    Case{"Form3NormalOnOtherProjects", "AT+QXDPDT=3", {}, "", "OK", {"rf dpdt normal"}},
-    Case{"Form3CrossOnRx6105F", "AT+QXDPDT=3", {"project=RX6105F_EX"}, "", "OK", {"rf dpdt cross"}},
+    Case{"CrossOnOtherProjects", "AT+QXDPDT=2", {}, "", "OK", {"rf dpdt cross"}, "cross"},
+    Case{"NormalOnRx6105", "AT+QXDPDT=2", {"project=RX6105"}, "", "OK", {"rf dpdt normal"}, "cross"},
+    Case{"Form3NormalOnOtherProjects", "AT+QXDPDT=3", {}, "", "OK", {"rf dpdt normal"}, "cross"},
+    Case{"Form3CrossOnRx6105F", "AT+QXDPDT=3", {"project=RX6105F_EX"}, "", "OK", {"rf dpdt cross"}, "cross"},
     Case{"SwitchFails", "AT+QXDPDT=2", {"fault=dpdt"}, "", "ERROR", {"rf dpdt cross (failed)"}},
     Case{"State", "AT+QXDPDT=4", {"em.118=6"}, "\r\n\"2,1\"\r\n", "OK", {kEm + "118 -> 6"}},
     Case{"StateHighBits", "AT+QXDPDT=4", {"em.118=29"}, "\r\n\"1,3\"\r\n", "OK", {kEm + "118 -> 29"}},
@@ -79,6 +83,12 @@ INSTANTIATE_TEST_SUITE_P(Dpdt, ModemLine, ::testing::Values(
     Case{"Tuner6OnRx6105", "AT+QXDPDT=6", {"project=RX6105"}, "", "OK", {kEm + "117 -> 0"}},
     Case{"Tuner7OnOtherProjects", "AT+QXDPDT=7", {"em.117=1"}, "", "ERROR", {kEm + "117 -> 1"}},
     Case{"Tuner7OnRx6105", "AT+QXDPDT=7", {"project=RX6105"}, "", "OK", {kEm + "116 -> 0"}},
+    // The service always starts; the NV flag is set only when the debug-port field is 1 or 2.
+    Case{"ServiceFieldOne", "AT+QXDPDT=5", {"adb=1"}, "", "OK", {"nv write", kService}},
+    Case{"ServiceFieldTwo", "AT+QXDPDT=5", {"adb=2"}, "", "OK", {"nv write", kService}},
+    Case{"ServiceFieldThree", "AT+QXDPDT=5", {"adb=3"}, "", "OK", {kService}},
+    Case{"ServiceNvReadFails", "AT+QXDPDT=5", {"adb=1", "fault=nv-read"}, "", "ERROR", {}},
+    Case{"ServiceNvWriteFails", "AT+QXDPDT=5", {"adb=1", "fault=nv-write"}, "", "ERROR", {}},
     Case{"RawState", "AT+QXDPDT=8", {"em.118=6"}, "\r\n6\r\n", "OK", {kEm + "118 -> 6"}},
     Case{"Status9", "AT+QXDPDT=9", {}, "", "OK", {kEm + "9 -> 0"}},
     Case{"Status10Refused", "AT+QXDPDT=10", {"em.10=9"}, "", "ERROR", {kEm + "10 -> 9"}},
@@ -100,7 +110,6 @@ INSTANTIATE_TEST_SUITE_P(Dpdt, ModemLine, ::testing::Values(
 INSTANTIATE_TEST_SUITE_P(DiversityAndSar, ModemLine, ::testing::Values(
     Case{"DrxOff", "AT+QX_DRX_OPT=0", {}, "", "ATOK", {kEm + "150 -> 0"}},
     Case{"DrxOnRefused", "AT+QX_DRX_OPT=1", {"em.151=1"}, "", "ATNG", {kEm + "151 -> 1"}},
-    Case{"DrxOnUndelivered", "AT+QX_DRX_OPT=1", {"fault=modem"}, "", "ATNG", {kEm + "151 (undelivered)"}},
     Case{"DrxStateZero", "AT+QX_DRX_OPT=2", {"em.152=0,x"}, "\r\n\"0\"\r\n", "ATOK", {kEm + "152 -> 0,x"}},
     Case{"DrxStateOne", "AT+QX_DRX_OPT=2", {"em.152=1"}, "\r\n\"1\"\r\n", "ATOK", {kEm + "152 -> 1"}},
     Case{"DrxStateOther", "AT+QX_DRX_OPT=2", {"em.152=2"}, "", "ATNG", {kEm + "152 -> 2"}},
@@ -108,48 +117,6 @@ INSTANTIATE_TEST_SUITE_P(DiversityAndSar, ModemLine, ::testing::Values(
     Case{"SarOff", "AT+QXSAR=0", {}, "", "OK", {kEm + "210 -> 0"}},
     Case{"SarOnRefused", "AT+QXSAR=1", {"em.211=1"}, "", "ERROR", {kEm + "211 -> 1"}},
     Case{"SarUnknown", "AT+QXSAR=2", {}, "", "ERROR", {}}),
-    by_name);
-
-TEST_F(Modem, DpdtCrossIsRecordedByBothSwitchForms) {
-    for (const char *line : {"AT+QXDPDT=2", "AT+QXDPDT=3"}) {
-        box.set_prop("persist.sys.dpdt", "");
-        served(line, "", "OK");
-        EXPECT_EQ(box.prop("persist.sys.dpdt"), "cross") << line;
-    }
-    box.set_prop("persist.sys.dpdt", "normal");
-    box.fault("dpdt");
-    served("AT+QXDPDT=2", "", "ERROR");
-    EXPECT_EQ(box.prop("persist.sys.dpdt"), "normal");
-}
-
-// AT+QXDPDT=5: the service always starts; the NV flag only when the debug-port field asks.
-struct ServiceCase {
-    const char *name;
-    int32_t adb_field;
-    const char *fault;
-    const char *word;
-    bool written, started;  // the NV flag (the service then always starts)
-};
-class DpdtService : public Modem, public ::testing::WithParamInterface<ServiceCase> {};
-
-TEST_P(DpdtService, StartsTheService) {
-    const ServiceCase &c = GetParam();
-    const std::string before = with_i32(nv_pattern(), 12, c.adb_field);
-    box.write("/.sim/nv.bin", before);
-    if (c.fault) box.fault(c.fault);
-    served("AT+QXDPDT=5", "", c.word);
-    EXPECT_EQ(box.read("/.sim/nv.bin"), c.written ? with_i32(before, 104, 1) : before);
-    const std::string start = "service-start com.pyxa.engineermode/.DpdtService  ";
-    using Lines = std::vector<std::string>;
-    EXPECT_EQ(rf_records(box.events()), (c.written ? Lines{"nv write", start} : c.started ? Lines{start} : Lines{}));
-}
-
-INSTANTIATE_TEST_SUITE_P(Dpdt, DpdtService, ::testing::Values(
-    ServiceCase{"FieldOneWritesFlag", 1, nullptr, "OK", true, true},
-    ServiceCase{"FieldTwoWritesFlag", 2, nullptr, "OK", true, true},
-    ServiceCase{"FieldThreeOnlyStarts", 3, nullptr, "OK", false, true},
-    ServiceCase{"ReadFails", 1, "nv-read", "ERROR", false, false},
-    ServiceCase{"WriteFails", 1, "nv-write", "ERROR", false, false}),
     by_name);
 
 }  // namespace
