@@ -1,6 +1,4 @@
 // The answer frame for every ResultCode, and where frames are routed.
-#include <cstdlib>
-
 #include "tests/support/checks.h"
 #include "tests/support/in_process.h"
 
@@ -25,11 +23,8 @@ INSTANTIATE_TEST_SUITE_P(AllCodes, FrameTest,
                          ::testing::Values(FrameCase{0, "\r\n\"v\"\r\n", "OK"}, FrameCase{3, "", "UNKNOWN"},
                                            FrameCase{4, "\"x\"", "ERROR"}, FrameCase{5, "ignored", nullptr},
                                            FrameCase{6, "b", ""}, FrameCase{7, "", "ATOK"}, FrameCase{8, "", "ATNG"},
-                                           FrameCase{9, "", "ATERROR"}, FrameCase{101, "", "Not Implement"},
-                                           FrameCase{-1, "", "UNKNOWN"}),
-                         [](const auto &i) {
-                             return (i.param.result < 0 ? "CodeMinus" : "Code") + std::to_string(std::abs(i.param.result));
-                         });
+                                           FrameCase{9, "", "ATERROR"}, FrameCase{101, "", "Not Implement"}),
+                         [](const auto &i) { return "Code" + std::to_string(i.param.result); });
 
 TEST_F(InProcess, LocalSocketGetsOneAnswerPerConnection) {
     connect_source(SRC_LOCAL);
