@@ -41,13 +41,14 @@ const bool kLongName = (memcpy(kFakeTable[1].name, "AT+ABCDEFGHIJKLMNOPQRSTUVWXY
 struct SearchCase {
     const char *line;
     int result, calls;
-    const char *frame;  // "": not answered here
+    const char *frame;  // "": nothing is written
     bool after;
 };
 
 class SearchTest : public InProcess, public ::testing::WithParamInterface<SearchCase> {};
 
-// The first row whose name equals the text before "=" or "?" answers (case-sensitive).
+// The first row whose name equals the text before "=" or "?" answers (case-sensitive), framed
+// with the trailer word of its result (every code without one is UNKNOWN); frames are logged.
 TEST_P(SearchTest, FirstEqualNameAnswers) {
     const SearchCase &c = GetParam();
     g_calls = 0;
@@ -55,10 +56,11 @@ TEST_P(SearchTest, FirstEqualNameAnswers) {
     g_after_cmd.clear();
     char line[kLineSize] = {0};
     strcpy(line, c.line);
-    EXPECT_EQ(search_command_table(kFakeTable, 3, line), *c.frame != '\0');
+    EXPECT_EQ(search_command_table(kFakeTable, 3, line), c.calls == 1 && c.result != RC_DECLINE);
     EXPECT_EQ(g_calls, c.calls);
     EXPECT_STREQ(line, c.line);
     EXPECT_EQ(answer(), c.frame);
+    EXPECT_EQ(box.exists("/cache/recovery/last_atcmd0"), *c.frame != '\0');
     EXPECT_EQ(g_after_cmd, c.after ? "#" + std::string(c.line + 1) : "");
 }
 
@@ -67,11 +69,19 @@ INSTANTIATE_TEST_SUITE_P(
     ::testing::Values(SearchCase{"AT+ONE=1", 0, 1, "AT+ONE=1\r\nbody\r\nOK\r\n", true},
                       SearchCase{"AT+ONE?", 4, 1, "AT+ONE?\r\nbody\r\nERROR\r\n", false},
                       SearchCase{"AT+ONE=1", 1, 1, "", false},  // declines: next table
-                      SearchCase{"AT+ONE", 0, 0, "", false},    // no "=" or "?"
+                      SearchCase{"AT+ONE=1", 3, 1, "AT+ONE=1\r\nbody\r\nUNKNOWN\r\n", false},
+                      SearchCase{"AT+ONE=1", 5, 1, "", false},  // answered without a frame
+                      SearchCase{"AT+ONE=1", 6, 1, "AT+ONE=1\r\nbody\r\n\r\n", false},
+                      SearchCase{"AT+ONE=1", 8, 1, "AT+ONE=1\r\nbody\r\nATNG\r\n", false},
+                      SearchCase{"AT+ONE=1", 9, 1, "AT+ONE=1\r\nbody\r\nATERROR\r\n", false},
+                      SearchCase{"AT+ONE=1", 101, 1, "AT+ONE=1\r\nbody\r\nNot Implement\r\n", false},
+                      SearchCase{"AT+ONE", 0, 0, "", false},  // no "=" or "?"
                       SearchCase{"at+one=1", 0, 0, "", false},
                       SearchCase{"AT+ABCDEFGHIJKLMNOPQRSTUVWXYZ0123456=1", 7, 1,
                                  "AT+ABCDEFGHIJKLMNOPQRSTUVWXYZ0123456=1\r\nbody\r\nATOK\r\n", false}),
-    named_by([](const SearchCase &c) { return c.line; }));
+    [](const auto &i) {
+        return test_name(i.param.line) + "_Rc" + std::to_string(i.param.result) + "_" + std::to_string(i.index);
+    });
 
 // Every row can be reached and run: a name without "=" or "?", a handler, the common argument.
 TEST(Tables, RowsAreWellFormed) {
