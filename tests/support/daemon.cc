@@ -146,7 +146,9 @@ Pty::~Pty() {
     close(master);
 }
 
-bool Pty::send(const std::string &s) const { return write(master, s.data(), s.size()) == static_cast<ssize_t>(s.size()); }
+bool Pty::send(const std::string &s) const {
+    return write(master, s.data(), s.size()) == static_cast<ssize_t>(s.size());
+}
 
 bool Pty::ready() const {
     for (int i = 0; i < 50; ++i) {

@@ -26,8 +26,7 @@ std::string temp_base() {
     return "/tmp";
 }
 
-// A daemon that is still winding down may create a file while we remove the tree; a few
-// rounds finish the job.
+// A daemon still winding down may create a file while we remove the tree: a few rounds.
 void remove_tree(const std::string &dir) {
     for (int round = 0; round < 20; ++round) {
         std::error_code ec;
