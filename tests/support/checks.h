@@ -13,16 +13,14 @@ inline std::string frame(const std::string &line, const std::string &body, const
     return line + "\r\n" + body + "\r\n" + word + "\r\n";
 }
 
-// A factory NV record whose every byte is non-zero (first + i % period), so that a cleared
-// or stray field shows against it.
+// A factory NV record whose every byte is non-zero (first + i % period): a cleared or stray field shows.
 inline std::string nv_fill(unsigned char first, unsigned period) {
     std::string nv(1012, '\0');
     for (size_t i = 0; i < nv.size(); ++i) nv[i] = static_cast<char>(first + i % period);
     return nv;
 }
 
-// Polls until done() holds, for at most ms: true when it did. Workers and models act on
-// threads of their own, so their effects are awaited, never assumed after a fixed sleep.
+// Polls until done() holds, for at most ms: effects of other threads are awaited, never slept for.
 inline bool wait_until(const std::function<bool()> &done, int ms = 3000) {
     for (auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);;) {
         if (done()) return true;

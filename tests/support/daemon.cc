@@ -12,10 +12,10 @@
 
 #include <chrono>
 #include <filesystem>
-#include <fstream>
-#include <sstream>
 #include <stdexcept>
 #include <thread>
+
+#include "platform/sim/sim.h"
 
 std::string read_some(int fd, size_t want, int timeout_ms) {
     std::string out;
@@ -30,13 +30,29 @@ std::string read_some(int fd, size_t want, int timeout_ms) {
     return out;
 }
 
-int free_tcp_port() {
-    int s = socket(AF_INET, SOCK_STREAM, 0);
-    struct sockaddr_in a {};
+static sockaddr_in loopback(int port) {
+    sockaddr_in a{};
     a.sin_family = AF_INET;
     a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    bind(s, reinterpret_cast<sockaddr *>(&a), sizeof a);
+    a.sin_port = htons(static_cast<uint16_t>(port));
+    return a;
+}
+
+// Polls every 20 ms until done() holds, for at most timeout_ms.
+template <typename F>
+static bool poll_for(F done, int timeout_ms) {
+    for (int waited = 0; waited < timeout_ms; waited += 20) {
+        if (done()) return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+    }
+    return false;
+}
+
+int free_tcp_port() {
+    int s = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in a = loopback(0);
     socklen_t len = sizeof a;
+    bind(s, reinterpret_cast<sockaddr *>(&a), len);
     getsockname(s, reinterpret_cast<sockaddr *>(&a), &len);
     close(s);
     return ntohs(a.sin_port);
@@ -74,39 +90,25 @@ Daemon::~Daemon() {
 }
 
 bool Daemon::wait_prop(const std::string &name, const std::string &value, int timeout_ms) const {
-    for (int waited = 0; waited < timeout_ms; waited += 20) {
-        if (box.prop(name) == value) return true;
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    }
-    return false;
+    return poll_for([&] { return box.prop(name) == value; }, timeout_ms);
 }
 
 std::string Daemon::log() const {
-    std::ifstream in(log_path);
-    std::ostringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
+    std::string text;
+    sim::read_file(log_path, text);  // outside the phone's root: no sequence moves on
+    return text;
 }
 
 bool Daemon::wait_log(const std::string &text, int timeout_ms) const {
-    for (int waited = 0; waited < timeout_ms; waited += 20) {
-        if (log().find(text) != std::string::npos) return true;
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    }
-    return false;
+    return poll_for([&] { return log().find(text) != std::string::npos; }, timeout_ms);
 }
 
 int Daemon::connect_tcp() const {
     int s = socket(AF_INET, SOCK_STREAM, 0);
-    struct sockaddr_in a {};
-    a.sin_family = AF_INET;
-    a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    a.sin_port = htons(static_cast<uint16_t>(port));
-    if (connect(s, reinterpret_cast<sockaddr *>(&a), sizeof a) != 0) {
-        close(s);
-        return -1;
-    }
-    return s;
+    sockaddr_in a = loopback(port);
+    if (connect(s, reinterpret_cast<sockaddr *>(&a), sizeof a) == 0) return s;
+    close(s);
+    return -1;
 }
 
 int Daemon::connect_local() const {
@@ -144,7 +146,9 @@ Pty::~Pty() {
     close(master);
 }
 
-bool Pty::send(const std::string &s) const { return write(master, s.data(), s.size()) == static_cast<ssize_t>(s.size()); }
+bool Pty::send(const std::string &s) const {
+    return write(master, s.data(), s.size()) == static_cast<ssize_t>(s.size());
+}
 
 bool Pty::ready() const {
     for (int i = 0; i < 50; ++i) {

@@ -19,8 +19,7 @@ struct Daemon {
     std::string local_name;
     std::string log_path;  // the daemon's stderr: its Android log
 
-    // Starts the daemon with the given kernel command line; waits until the TCP
-    // service waits for a station (unless wait_ready is false).
+    // Starts the daemon with this kernel command line; waits until TCP awaits a station (if wait_ready).
     Daemon(const Sandbox &box, const std::string &cmdline = "", bool wait_ready = true);
     ~Daemon();
 
@@ -35,8 +34,7 @@ struct Daemon {
     int stop(int sig);
 };
 
-// A pseudo-terminal whose slave the daemon opens as one of its serial ports: the test
-// is the station on the master side.
+// A pseudo-terminal whose slave the daemon opens as a serial port; the test is the station on the master.
 struct Pty {
     int master = -1;
     int keep = -1;  // the slave held open, so that the master sees no hang-up on reopens

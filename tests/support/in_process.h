@@ -25,8 +25,7 @@ protected:
         connect_source(SRC_TCP);
     }
     void TearDown() override {
-        // Workers the handlers started act on this sandbox: let them finish first. One
-        // that never ends by itself (its run flag still set) is given up on after a while.
+        // Workers the handlers started act on this sandbox: let them finish (a stuck one is given up on).
         if (!wait_workers_done(5000)) fprintf(stderr, "note: a worker is still running after its test\n");
         for (int fd : {g_port.uart_fd, g_port.usb_fd, g_port.tcp_client_fd, g_port.local_client_fd})
             if (fd >= 0) close(fd);

@@ -26,8 +26,7 @@ std::string temp_base() {
     return "/tmp";
 }
 
-// A daemon that is still winding down may create a file while we remove the tree; a few
-// rounds finish the job.
+// A daemon still winding down may create a file while we remove the tree: a few rounds.
 void remove_tree(const std::string &dir) {
     for (int round = 0; round < 20; ++round) {
         std::error_code ec;
@@ -90,10 +89,9 @@ std::vector<Event> Sandbox::event_list() const {
     for (std::string l; std::getline(in, l);) {
         size_t a = l.find(' ');
         if (a == std::string::npos) continue;
-        size_t b = l.find(' ', a + 1);
-        Event e{strtoll(l.c_str(), nullptr, 10), l.substr(a + 1, b == std::string::npos ? b : b - a - 1),
-                b == std::string::npos ? "" : l.substr(b + 1)};
-        out.push_back(e);
+        size_t b = l.find(' ', a + 1);  // npos: a kind without detail
+        out.push_back({strtoll(l.c_str(), nullptr, 10), l.substr(a + 1, b - a - 1),
+                       b == std::string::npos ? "" : l.substr(b + 1)});
     }
     return out;
 }
