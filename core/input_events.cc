@@ -141,6 +141,8 @@ int ev_init(ev_callback cb, void *data) {
     g_device_count = 0;
     if (!dev::exists("/dev/input")) {
         LOGE("ftcmd_input: %s: dir(%s) open fail, error=%s", __func__, "/dev/input", strerror(ENOENT));
+        close(g_epfd);  // every failed start would otherwise leave one epoll descriptor open
+        g_epfd = -1;
         return -1;
     }
     bool add_failed = false;

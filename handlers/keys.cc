@@ -206,17 +206,14 @@ int write_raw_data(char *resp) {
 
 int lcm_activity(const char *extras) { return startActivityFromFtcmd(kLcmComponent, kLcmAction, extras); }
 
-// The second line of the virtual keys' capacitance test, without its line feed.
+// The second line of the virtual keys' capacitance test as fgets gives it, line feed kept.
 int virtual_key_capacitance(char *resp) {
     FILE *f = dev::fopen(kVirtualKeyTest, "r");
     if (f == nullptr) return RC_ERROR;
     char line[256] = {};
     bool second = fgets(line, sizeof line, f) != nullptr && fgets(line, sizeof line, f) != nullptr;
     fclose(f);
-    if (second) {
-        line[strcspn(line, "\n")] = '\0';
-        quote_body(resp, line);
-    }
+    if (second) quote_body(resp, line);
     return RC_OK;
 }
 
@@ -247,7 +244,7 @@ int virtual_key_handler(char *cmd, int arg, char *resp) {
     if (line_is(cmd, "AT+QXVIRKEY=2") || line_is(cmd, "AT+QXVIRKEY=0")) {
         bool on = cmd[12] == '2';
         if (write_int(kButtonBacklight, on ? 255 : 0) != 0) return RC_ERROR;
-        if (!is_sp) lcm_activity(on ? "-e lcm_color 0" : "");
+        if (!is_sp) lcm_activity(on ? "-e lcm_color 0" : nullptr);
         return RC_OK;
     }
     return invalid_command(cmd);

@@ -17,8 +17,6 @@
 #include <thread>
 #include <vector>
 
-#include <android-base/parseint.h>
-
 #include "core/command_tables/handlers.h"
 #include "core/port_state.h"
 #include "handlers/common.h"
@@ -46,8 +44,8 @@ constexpr size_t kDdrSecondsMax = 9;
 constexpr char kOtgProperty[] = "sys.otg.dev";
 constexpr char kUsbDevices[] = "/sys/kernel/debug/usb/devices";
 constexpr int kOtgSecondsMax = 600;
-// "otg_test 1 <x>" must fit one message; a longer x is refused instead of cut.
-constexpr size_t kOtgMessageSize = 128;
+// "otg_test 1 <x>" with any x a line can carry: the message is never cut.
+constexpr size_t kOtgMessageSize = sizeof "otg_test 1 " + kLineSize;
 
 std::atomic<int> g_otg_checks{0};
 
@@ -129,7 +127,7 @@ LifeNodes life_nodes() {
             dev::exists("/sys/ufs/DeviceLifeTimeEstB") ? "/sys/ufs/DeviceLifeTimeEstB" : "/sys/ufs/life_time_b"};
 }
 
-int ddr_start(char *cmd) {
+int ddr_start(char *cmd, char *resp) {
     // Fields: "AT+QXDDR=1", the seconds, and one more that the station always sends.
     std::vector<std::string_view> fields = comma_fields(cmd);
     std::string_view secs = fields.size() >= 3 ? fields[1] : std::string_view{};
@@ -137,6 +135,7 @@ int ddr_start(char *cmd) {
                   secs.find_first_not_of("0123456789") == std::string_view::npos;
     if (!digits) {
         LOGE("parameter error");
+        body_printf(resp, "parameter error");
         return RC_ERROR;
     }
     char ps[1024] = {0};
@@ -186,10 +185,7 @@ int otg_enable(char *cmd) {
     const char *comma = strchr(cmd, ',');
     if (comma == nullptr || comma[1] == '\0') return invalid_command(cmd);
     char message[kOtgMessageSize];
-    if (snprintf(message, sizeof message, "otg_test 1 %s", comma + 1) >= static_cast<int>(sizeof message)) {
-        LOGE("otg parameter too long");
-        return RC_ERROR;
-    }
+    snprintf(message, sizeof message, "otg_test 1 %s", comma + 1);
     return test_app_ok(message) ? RC_OK : RC_ERROR;
 }
 
@@ -202,9 +198,9 @@ int otg_state(char *resp) {
 
 int otg_device_start(char *cmd, char *resp) {
     const char *comma = strchr(cmd, ',');
-    int seconds = 0;
-    // Range-checked parsing: a huge count must not wrap round into the range.
-    if (comma == nullptr || !android::base::ParseInt(std::string(without_line_end(comma + 1)), &seconds, 1, kOtgSecondsMax)) {
+    long long seconds = 0;
+    // Read as atoi reads it, range-checked so that a huge count cannot wrap round into it.
+    if (comma == nullptr || !leading_number(comma + 1, 1, kOtgSecondsMax, &seconds)) {
         quote_reason(resp, "para error");
         return RC_ATNG;
     }
@@ -212,7 +208,7 @@ int otg_device_start(char *cmd, char *resp) {
         quote_reason(resp, "open otg error");
         return RC_ATNG;
     }
-    int *arg = new (std::nothrow) int(seconds);
+    int *arg = new (std::nothrow) int(static_cast<int>(seconds));
     if (arg == nullptr) return RC_ATNG;
     ++g_otg_checks;
     pthread_t t;
@@ -404,7 +400,7 @@ int emmcfw_handler(char *cmd, int arg, char *resp) {
 }
 
 int ddr_stress_test_handler(char *cmd, int arg, char *resp) {
-    if (line_starts(cmd, "AT+QXDDR=1", 10)) return ddr_start(cmd);
+    if (line_starts(cmd, "AT+QXDDR=1", 10)) return ddr_start(cmd, resp);
     if (line_is(cmd, "AT+QXDDR=0")) return ddr_result(resp);
     if (line_is(cmd, "AT+QXDDR=2")) return ddr_boot_check(resp);
     return invalid_command(cmd);

@@ -196,7 +196,7 @@ INSTANTIATE_TEST_SUITE_P(KeyTest, KeyLine, ::testing::Values(
     Case{"AppSilent", "AT+QXKEY=0", [](const Sandbox &b) { b.fault("testapp-silent"); }, "", "ERROR"},
     Case{"AppRefuses", "AT+QXKEY=1", reply("key_test 1", "busy"), "", "ERROR"},
     Case{"Unknown", "AT+QXKEY=2", nullptr, "", "ERROR"},
-    Case{"Capacitance", "AT+QXVIRKEY=1", nullptr, "\r\n\"120,131,118\"\r\n", "OK", {}, "activity"},
+    Case{"Capacitance", "AT+QXVIRKEY=1", nullptr, "\r\n\"120,131,118\n\"\r\n", "OK", {}, "activity"},
     Case{"OneLineNoBody", "AT+QXVIRKEY=1", [](const Sandbox &b) { b.write(kCapacitance, "menu,home,back\n"); }, "", "OK"},
     Case{"CapacitanceMissing", "AT+QXVIRKEY=1", gone(kCapacitance), "", "ERROR"},
     Case{"LightOn", "AT+QXVIRKEY=2", nullptr, "", "OK", {kLcm + "-e lcm_color 0\n"}, nullptr, {{kBacklight, "255"}}},
