@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <cstring>
 #include <string_view>
+#include <vector>
 
 #include "core/command_tables/handlers.h"
 #include "core/nv.h"
@@ -27,19 +28,6 @@ namespace {
 constexpr const char *kMissingTfData = "Missing TF_Data!";
 constexpr int kDelayMin = 180;
 constexpr int kDelayMax = 900;
-
-// Calls fn on each non-empty comma-separated field of a line, in order, while fn returns
-// true. Empty fields are skipped, as a tokeniser would: "1,,0" has two fields.
-template <typename Fn>
-void for_each_field(std::string_view line, Fn &&fn) {
-    for (;;) {
-        size_t comma = line.find(',');
-        std::string_view field = line.substr(0, comma);
-        if (!field.empty() && !fn(field)) return;
-        if (comma == std::string_view::npos) return;
-        line.remove_prefix(comma + 1);
-    }
-}
 
 // Immediate reset: the test app wipes the phone; the modem's test-network settings and
 // the old AT logs would survive it, so they go too.
@@ -64,13 +52,8 @@ int restore_now(char *resp, int variant) {
 // AT+QX_FRS_SHD=1,<seconds>,<oemFlag>: the delay is kept in the NV record so that the
 // test app can carry out the reset when it runs out, even across a restart.
 int restore_delayed(char *cmd, char *resp) {
-    std::array<std::string_view, 3> f;
-    size_t fields = 0;
-    for_each_field(cmd, [&](std::string_view field) {
-        f[fields++] = field;
-        return fields < f.size();
-    });
-    if (fields < f.size()) {
+    std::vector<std::string_view> f = comma_fields(cmd);
+    if (f.size() < 3) {
         LOGE("paramter error");
         return RC_ATNG;
     }
@@ -138,25 +121,24 @@ constexpr std::array<LogSet, 9> kLogSets{{
 // AT+QXLOG=5,<name>[,<name>...]: the values are added, so a set named twice counts twice.
 int log_sets(char *cmd, char *resp) {
     unsigned int mask = 1;
-    int names = -1;  // the first field is the command itself
-    std::string_view unknown;
-    for_each_field(cmd, [&](std::string_view name) {
-        if (++names == 0) return true;
-        for (const LogSet &s : kLogSets) {
-            if (name.size() == strlen(s.name) && strncasecmp(name.data(), s.name, name.size()) == 0) {
-                mask += s.value;
-                return true;
-            }
+    int names = 0;
+    std::vector<std::string_view> fields = comma_fields(cmd);  // the first is the command itself
+    for (size_t i = 1; i < fields.size(); ++i) {
+        // Over TCP the station's line end stays in the line; it is no part of the last name.
+        std::string_view name = i + 1 < fields.size() ? fields[i] : without_line_end(fields[i]);
+        if (name.empty()) continue;
+        const LogSet *set = nullptr;
+        for (const LogSet &s : kLogSets)
+            if (name.size() == strlen(s.name) && strncasecmp(name.data(), s.name, name.size()) == 0) set = &s;
+        if (set == nullptr) {
+            LOGE("unknown log name: %.*s", static_cast<int>(name.size()), name.data());
+            quote_body(resp, "unknown log name");
+            return RC_ATNG;
         }
-        unknown = name;
-        return false;
-    });
-    if (!unknown.empty()) {
-        LOGE("unknown log name: %.*s", static_cast<int>(unknown.size()), unknown.data());
-        quote_body(resp, "unknown log name");
-        return RC_ATNG;
+        mask += set->value;
+        ++names;
     }
-    if (names <= 0) {
+    if (names == 0) {
         quote_body(resp, "invalid log name");
         return RC_ATERROR;
     }

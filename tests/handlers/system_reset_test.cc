@@ -101,6 +101,9 @@ INSTANTIATE_TEST_SUITE_P(LogAndDump, SystemResetTest, ::testing::Values(
          .events = "kaellog at_mode=0 mask=0xE048085\n"},
     Case{.line = "AT+QXLOG=5,camera,foo", .body = "\r\n\"unknown log name\"\r\n", .word = "ATNG"},
     Case{.line = "AT+QXLOG=5", .body = "\r\n\"invalid log name\"\r\n", .word = "ATERROR"},
+    // Over TCP the station's line end stays in the line; it is no part of the last name.
+    Case{.line = "AT+QXLOG=5,camera\r\n", .word = "ATOK", .events = "kaellog at_mode=0 mask=0x40001\n"},
+    Case{.line = "AT+QXLOG=5,\r\n", .body = "\r\n\"invalid log name\"\r\n", .word = "ATERROR"},
     Case{.line = "AT+QXLOG=6", .word = "ATOK"},
     Case{.line = "AT+QXLOG=4", .word = "ERROR"},
     Case{.line = "AT+QX_TRG_DUMP=0", .word = "ATOK", .events = "sysrq c\n"},
