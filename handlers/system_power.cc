@@ -29,6 +29,8 @@ constexpr size_t kCloseClear496 = 496;
 
 constexpr const char *kFastSearchService = "com.android.phone.fastSearchNet.FastSearchNetService";
 constexpr const char *kDpdtService = "com.pyxa.engineermode.DpdtService";
+constexpr int kFastSearchStopTries = 25;  // 200 ms apart
+constexpr int kDpdtStopTries = 50;        // 100 ms apart
 constexpr const char *kDpdtComponent = "com.pyxa.engineermode/.DpdtService";
 constexpr const char *kPnActivity = "com.pyxa.engineermode/.PnActivity";
 constexpr const char *kPnService = "com.pyxa.engineermode/.PnService";
@@ -117,14 +119,20 @@ int close_adb() {
     rec.set_i32(kCloseClear100, 0);
     rec.set_i32(nv::kFirstBootDone, 0);
 
-    while (isServiceWork(kFastSearchService)) {
+    // A service that never stops (or restarts itself) would hold the dispatch lock, and every
+    // station with it, for ever: each wait ends after 5 s and the close goes on.
+    int tries = 0;
+    while (isServiceWork(kFastSearchService) && tries++ < kFastSearchStopTries) {
         sendBroadcastFromFtcmd(nullptr, kFastSearchService, kStopExtras);
         usleep(200 * 1000);
     }
-    while (isServiceWork(kDpdtService)) {
+    if (tries > kFastSearchStopTries) LOGE("%s still runs", kFastSearchService);
+    tries = 0;
+    while (isServiceWork(kDpdtService) && tries++ < kDpdtStopTries) {
         stopServiceFromFtcmd(kDpdtComponent, nullptr, nullptr);
         usleep(100 * 1000);
     }
+    if (tries > kDpdtStopTries) LOGE("%s still runs", kDpdtService);
 
     rec.set_i32(kCloseClear104, 0);
     kaelatcmd_set_system_property("sys.dpdt.floating", "0");

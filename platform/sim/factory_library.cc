@@ -195,14 +195,15 @@ int startServiceFromFtcmd(const char *component, const char *action, const char 
 
 int stopServiceFromFtcmd(const char *component, const char *action, const char *extras) {
     sim::record("service-stop", opt(component) + " " + opt(action) + " " + opt(extras));
-    services_edit(component_class(component), false);
+    if (!sim::fault("service-stuck")) services_edit(component_class(component), false);
     return 0;
 }
 
 // A service told "--es status 0" stops itself, as the fast-search service does.
 int sendBroadcastFromFtcmd(const char *action, const char *component, const char *extras) {
     sim::record("broadcast", opt(action) + " " + opt(component) + " " + opt(extras));
-    if (opt(extras).find("status 0") != std::string::npos) services_edit(component_class(component), false);
+    if (opt(extras).find("status 0") != std::string::npos && !sim::fault("service-stuck"))
+        services_edit(component_class(component), false);
     return 0;
 }
 

@@ -107,6 +107,8 @@ INSTANTIATE_TEST_SUITE_P(Power, PowerLine, ::testing::Values(
     Case{"AT+QXACM=3", nullptr, "", "OK", Nv::Closed, {"message shutdown delay -> ok", kCharging}},
     Case{"AT+QXACM=4", nullptr, "", "ERROR", Nv::Closed, {}, "message shutdown"},
     Case{"AT+QXADB=0,1", rep("shutdown immediately", "busy"), "", "ERROR", Nv::Closed},
+    // A service that never stops holds the close only for a bounded time.
+    Case{"AT+QXADB=0,1", fault("service-stuck"), "", "OK", Nv::Closed, {"message shutdown immediately -> ok"}},
     Case{"AT+QXADB=0,3", rep("shutdown delay", "no"), "", "ERROR", Nv::Closed},
     Case{"AT+QXADB=0,0", rep("restoreSystemSettings", "done ok"), "", "OK", Nv::Closed},
     Case{"AT+QX_SHD_TIME=1,36", nullptr, "", "ATOK", Nv::Closed,
