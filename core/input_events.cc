@@ -15,6 +15,7 @@
 #include <mutex>
 #include <string>
 
+#include "core/workers.h"
 #include "platform/android.h"
 #include "platform/device.h"
 #include "platform/log.h"
@@ -71,9 +72,7 @@ thread_local int t_ready_count = 0;
 std::mutex g_table_mu;
 
 std::atomic<int> g_running{0};
-// A stop and a quick restart could leave the old thread running beside the new one (the
-// running flag is 1 again when it wakes): each thread ends as soon as its start is over.
-std::atomic<unsigned> g_generation{0};
+WorkerGeneration g_generation;
 pthread_t g_input_thread{};
 volatile sig_atomic_t g_signalled = 0;
 
@@ -112,12 +111,11 @@ void handle_key(const struct input_event &ev) {
 }
 
 void *input_waiting_thread(void *arg) {
-    const unsigned generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
     LOGI("ftcmd_input: %s: thread(input_waiting_thread) started", __func__);
-    while (g_generation == generation && g_signalled == 0) {
+    while (g_generation.current(arg) && g_signalled == 0) {
         if (ev_wait(500) == 0) {
             std::lock_guard<std::mutex> lk(g_table_mu);
-            if (g_generation == generation && g_running) ev_dispatch();
+            if (g_generation.current(arg) && g_running) ev_dispatch();
         }
         if (!g_running) break;
     }
@@ -256,10 +254,10 @@ int create_input_threads() {
     sa.sa_handler = on_sigusr1;
     sigaction(SIGUSR1, &sa, nullptr);
     g_signalled = 0;
-    uintptr_t generation = ++g_generation;
+    void *generation = g_generation.next();
     g_running = 1;
     pthread_t tid;
-    int rc = pthread_create(&tid, nullptr, input_waiting_thread, reinterpret_cast<void *>(generation));
+    int rc = pthread_create(&tid, nullptr, input_waiting_thread, generation);
     if (rc != 0) {
         g_running = 0;
         ev_exit();
@@ -274,7 +272,7 @@ int create_input_threads() {
 
 void exit_input_threads() {
     g_running = 0;
-    ++g_generation;
+    g_generation.end();
     ev_exit();
 }
 

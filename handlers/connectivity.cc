@@ -195,13 +195,12 @@ int list_bt_devices(char *resp) {
 
 // ---- GPS
 
-// The worker and the handler share these without the dispatch mutex. A stream stopped by
-// AT+QXGPS=0 and started again at once would otherwise have two workers: each worker
-// carries the generation it was started in and ends when that is over.
+// The worker and the handler share these without the dispatch mutex; AT+QXGPS=0 ends the
+// worker's generation, so a stream started again at once never has two workers.
 std::atomic<bool> g_gps_opened{false};
 std::atomic<bool> g_gps_streaming{false};
 std::atomic<bool> g_gps_worker{false};  // a worker id is recorded
-std::atomic<unsigned> g_gps_generation{0};
+WorkerGeneration g_gps_generation;
 
 bool gps_request(int option, char *reply) {
     zdr_gps_option_req req{option};
@@ -209,13 +208,12 @@ bool gps_request(int option, char *reply) {
 }
 
 void *update_gps_value_thread(void *arg) {
-    const unsigned generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
     // Nobody joins a stream worker: detached, its stack goes back when it ends instead of
     // piling up with every AT+QXGPS=2 of a long shift.
     pthread_detach(pthread_self());
     LOGI("Start");
     wait_for_current_answer();
-    while (g_gps_streaming && g_gps_generation == generation) {
+    while (g_gps_streaming && g_gps_generation.current(arg)) {
         char reply[kGpsReplySize] = {};
         bool sent = gps_request(2, reply);
         writeDataToSerial(reply, static_cast<int>(strnlen(reply, sizeof reply)));
@@ -261,15 +259,14 @@ int gps_close() {
     g_gps_opened = false;
     g_gps_streaming = false;
     g_gps_worker = false;
-    ++g_gps_generation;
+    g_gps_generation.end();
     return RC_OK;
 }
 
 int gps_stream() {
     g_gps_streaming = true;
     if (g_gps_worker) return RC_OK;
-    uintptr_t generation = g_gps_generation;
-    int rc = start_worker(update_gps_value_thread, reinterpret_cast<void *>(generation));
+    int rc = start_worker(update_gps_value_thread, g_gps_generation.now());
     if (rc != 0) {
         LOGE("fail to create adc_test_thread errno:%d", rc);
         return RC_ERROR;

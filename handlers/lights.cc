@@ -13,7 +13,6 @@
 #include <atomic>
 #include <chrono>
 #include <climits>
-#include <cstdint>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
@@ -55,15 +54,12 @@ constexpr char kRingEffect[] = "/sys/class/leds/aw22xxx_led/effect";
 constexpr char kRingCfg[] = "/sys/class/leds/aw22xxx_led/cfg";
 constexpr char kTestInfo[] = "/cache/recovery/last_test_info";
 constexpr char kAirplaneFailed[] = "\r\nexit airplane mode failed\r\n";
-// A stop and a quick restart can find the old worker still asleep in its pass: the
-// generation tells it that it was replaced, so it leaves without touching the flag or the
-// nodes that now belong to its successor.
-std::atomic<unsigned> g_instant_generation{0};
-std::atomic<unsigned> g_lights_generation{0};
+WorkerGeneration g_instant_generation;
+WorkerGeneration g_lights_generation;
 
 struct InstantTimes {
     int on, interval;
-    unsigned generation;
+    void *generation;
 };
 
 // Boards whose green LED is driven through its engineering node.
@@ -168,7 +164,7 @@ void *update_vibrator_thread(void *) {
 void *instant_vibrate_thread(void *arg) {
     const InstantTimes times = *static_cast<InstantTimes *>(arg);
     delete static_cast<InstantTimes *>(arg);
-    const auto current = [&] { return times.generation == g_instant_generation; };
+    const auto current = [&] { return g_instant_generation.current(times.generation); };
     LOGI("Start on %d interval %d", times.on, times.interval);
     g_vibrator_run = 1;
     long long total = 0;
@@ -193,8 +189,7 @@ void *instant_vibrate_thread(void *arg) {
 }
 
 void *update_indicate_lights_thread(void *arg) {
-    const auto generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
-    const auto current = [&] { return generation == g_lights_generation; };
+    const auto current = [&] { return g_lights_generation.current(arg); };
     LOGI("Start");
     const char *red = "/sys/class/leds/red/brightness";
     const char *green = green_node("/sys/class/leds/green/brightness");
@@ -284,7 +279,7 @@ int vibrator_instant_handler(char *cmd, int, char *resp) {
         body_printf(resp, "time invalid");
         return RC_ATNG;
     }
-    auto *arg = new (std::nothrow) InstantTimes{times[0], times[1], ++g_instant_generation};
+    auto *arg = new (std::nothrow) InstantTimes{times[0], times[1], g_instant_generation.next()};
     if (arg == nullptr) return RC_ATNG;
     // Raised here as well as in the worker, so a second start right after this one is
     // refused even before the worker has run.
@@ -326,8 +321,7 @@ int indicatelights_test_handler(char *cmd, int, char *) {
     if (line_is(cmd, "AT+QXLIGHT=1")) {
         if (g_lights_run) return RC_OK;
         g_lights_run = 1;
-        auto generation = static_cast<uintptr_t>(++g_lights_generation);
-        if (start_worker(update_indicate_lights_thread, reinterpret_cast<void *>(generation)) != 0) {
+        if (start_worker(update_indicate_lights_thread, g_lights_generation.next()) != 0) {
             g_lights_run = 0;
             return RC_ERROR;
         }

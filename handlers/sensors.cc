@@ -296,15 +296,14 @@ int answer_property(const char *name, char *resp) {
     return RC_ATOK;
 }
 
-// A stop and a new start within one period would otherwise find the old stream awake
-// again with the flag set, and the station would get two readings each period.
-std::atomic<unsigned> g_gsensor_generation{0};
+// Without it, a stop and a new start within one period would give the station two
+// readings each period.
+WorkerGeneration g_gsensor_generation;
 
 void *update_gsensor_z_thread(void *arg) {
-    const auto generation = static_cast<unsigned>(reinterpret_cast<uintptr_t>(arg));
     LOGI("start");
     wait_for_current_answer();
-    while (g_gsensor_stream.load() == 1 && generation == g_gsensor_generation.load()) {
+    while (g_gsensor_stream.load() == 1 && g_gsensor_generation.current(arg)) {
         ResultPtr r = new_result();
         if (!r) {
             LOGE("malloc fail!");
@@ -328,8 +327,7 @@ int start_z_stream() {
         return RC_OK;
     }
     g_gsensor_stream = 1;
-    auto generation = static_cast<uintptr_t>(++g_gsensor_generation);
-    int rc = start_worker(update_gsensor_z_thread, reinterpret_cast<void *>(generation));
+    int rc = start_worker(update_gsensor_z_thread, g_gsensor_generation.next());
     if (rc != 0) {
         // The flag stays set, as after a stream that a failed reading ended: only
         // AT+QXZLJC=0,0 clears it.
